@@ -1,0 +1,619 @@
+#include <marubackup-util/sub_process.h>
+
+#include <fcntl.h>
+#include <pthread.h>
+#include <signal.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <sys/time.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <functional>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "support/files.h"
+#include "support/in_child.h"
+#include "support/syscall_filter.h"
+#include "support/temp_dir.h"
+
+using MARU::Backup::SubProcess;
+using support::describeStatus;
+using support::readFile;
+using support::runInChild;
+using support::TempDir;
+using support::writeFile;
+
+namespace {
+
+enum class Way { CALL, EXEC };
+
+/** What a caller reports of a program that it called, or could not replace itself with. */
+struct Result {
+    int status;
+    int error;
+};
+
+/** The tests of it hold for call() and for exec() alike. */
+class ARunProgram : public testing::TestWithParam<Way> {
+protected:
+    using Preparation = std::function<void()>;
+
+    /**
+     * Runs `process` from a caller of its own, a forked child with the system's
+     * PATH that `prepare` has changed before. How the program ended in words,
+     * as of describeStatus().
+     */
+    std::string outcome(
+        const SubProcess& process, const Preparation& prepare = [] {}) {
+        int report[2];
+        EXPECT_EQ(0, pipe2(report, O_CLOEXEC));
+        const int callerStatus = runInChild([&] {
+            setenv("PATH", "/usr/bin:/bin", 1);
+            prepare();
+            const int status = GetParam() == Way::CALL ? process.call() : process.exec();
+            const Result result = {status, errno};
+            return write(report[1], &result, sizeof result) == sizeof result ? 0 : 1;
+        });
+        close(report[1]);
+        Result result = {callerStatus, 0};
+        const ssize_t got = read(report[0], &result, sizeof result); // nothing once a program took the caller's place
+        close(report[0]);
+        EXPECT_TRUE(got == 0 || got == sizeof result);
+        errno = result.error;
+        return describeStatus(result.status);
+    }
+
+    /** What `process` writes to its standard output; it must end with 0. */
+    std::string outputOf(
+        SubProcess& process, const Preparation& prepare = [] {}) {
+        process.setStdOutput(out, 0);
+        EXPECT_EQ("exit 0", outcome(process, prepare));
+        return readFile(out);
+    }
+
+    /** Makes a program in the folder `folder` that writes `text`. */
+    std::string makeProgram(const std::string& folder, const std::string& name, const std::string& text) {
+        mkdir(folder.c_str(), 0755);
+        const std::string program = folder + "/" + name;
+        writeFile(program, "#!/bin/sh\necho " + text + "\n", 0755);
+        return program;
+    }
+
+    const TempDir dir;
+    const std::string out = dir.path("out");
+    const std::string err = dir.path("err");
+};
+
+INSTANTIATE_TEST_SUITE_P(SubProcess, ARunProgram, testing::Values(Way::CALL, Way::EXEC),
+                         [](const testing::TestParamInfo<Way>& way) {
+                             return way.param == Way::CALL ? "Call" : "Exec";
+                         });
+
+std::list<std::string> shell(const std::string& script) {
+    return {"/bin/sh", "-c", script};
+}
+
+bool exists(const std::string& path) {
+    return access(path.c_str(), F_OK) == 0;
+}
+
+mode_t permissionsOf(const std::string& path) {
+    struct stat info = {};
+    EXPECT_EQ(0, stat(path.c_str(), &info)) << path;
+    return info.st_mode & 07777;
+}
+
+/** The rest of the line of `text` that starts with `label`. */
+std::string field(const std::string& text, const std::string& label) {
+    const std::size_t start = text.find(label);
+    if (start == std::string::npos) {
+        return "no " + label;
+    }
+    const std::size_t valueStart = text.find_first_not_of(" \t", start + label.size());
+    return text.substr(valueStart, text.find('\n', valueStart) - valueStart);
+}
+
+void ignoreSignalHandled(int) {
+}
+
+void handle(int signalNumber, void (*handler)(int)) {
+    struct sigaction action = {};
+    action.sa_handler = handler; // and not SA_RESTART
+    sigaction(signalNumber, &action, nullptr);
+}
+
+/** Blocks all signals, and ignores or handles all but SIGCHLD, also those that glibc keeps to itself. */
+void changeAllSignals() {
+    const unsigned long ignored[8] = {1};
+    const std::size_t maskSize = _NSIG / 8;
+    for (int signalNumber = 1; signalNumber < _NSIG; ++signalNumber) {
+        if (signalNumber != SIGCHLD) {
+            syscall(SYS_rt_sigaction, signalNumber, ignored, nullptr, maskSize);
+        }
+    }
+    handle(SIGTERM, ignoreSignalHandled);
+    sigset_t all;
+    sigfillset(&all);
+    sigprocmask(SIG_BLOCK, &all, nullptr);
+}
+
+/** Opens descriptors that a program inherits if nobody keeps them from it. */
+void openMoreDescriptors() {
+    const int null = open("/dev/null", O_RDWR);
+    for (const int descriptor : {0, 3, 4, 17, 200}) {
+        dup2(null, descriptor);
+    }
+}
+
+void closeStandardDescriptors() {
+    close(0);
+    close(1);
+    close(2);
+}
+
+/** Writes the numbers of the shell's own open descriptors, as far as 9. */
+const char LIST_DESCRIPTORS[] = "for n in 0 1 2 3 4 5 6 7 8 9; do if [ -e /proc/$$/fd/$n ]; then echo $n; fi; done";
+
+} // namespace
+
+// How it ends.
+
+TEST_P(ARunProgram, EndsWithItsExitStatus) {
+    EXPECT_EQ("exit 0", outcome(SubProcess({"/bin/true"})));
+    EXPECT_EQ("exit 7", outcome(SubProcess(shell("exit 7"))));
+    EXPECT_EQ("exit 255", outcome(SubProcess(shell("exit 255"))));
+}
+
+TEST_P(ARunProgram, EndsWithTheSignalThatKilledIt) {
+    EXPECT_EQ("signal 9", outcome(SubProcess(shell("kill -9 $$"))));
+    EXPECT_EQ("signal 15", outcome(SubProcess(shell("kill -15 $$"))));
+}
+
+// What is run.
+
+TEST_P(ARunProgram, ReceivesItsArgumentsAsTheyAre) {
+    SubProcess process({"printf", "[%s]", "a b", "", "*", "$HOME", "'\"\\", "\n", "\xff"});
+
+    EXPECT_EQ("[a b][][*][$HOME]['\"\\][\n][\xff]", outputOf(process));
+}
+
+TEST_P(ARunProgram, IsCalledAsTheCallerNamedIt) {
+    SubProcess process({"sh", "-c", "echo $0"});
+
+    EXPECT_EQ("sh\n", outputOf(process));
+}
+
+TEST_P(ARunProgram, MustBeThere) {
+    EXPECT_EQ("failed: No such file or directory", outcome(SubProcess({dir.path("missing")})));
+    EXPECT_EQ("failed: No such file or directory", outcome(SubProcess({"marubackup-test-no-such-program"})));
+    EXPECT_EQ("failed: Not a directory", outcome(SubProcess({"/dev/null/program"})));
+}
+
+TEST_P(ARunProgram, MustBeAnExecutableFile) {
+    const std::string plain = dir.path("plain");
+    writeFile(plain, "#!/bin/sh\n", 0644);
+
+    EXPECT_EQ("failed: Permission denied", outcome(SubProcess({plain})));
+    EXPECT_EQ("failed: Permission denied", outcome(SubProcess({dir.path()})));
+}
+
+TEST_P(ARunProgram, MayBeAScriptThatNamesItsInterpreter) {
+    SubProcess process({makeProgram(dir.path("bin"), "script", "ran")});
+
+    EXPECT_EQ("ran\n", outputOf(process));
+}
+
+TEST_P(ARunProgram, IsNotHandedToAShellIfItIsNoProgram) {
+    writeFile(dir.path("script"), "exit 0\n", 0755);
+    const auto searchThere = [this] { setenv("PATH", dir.path().c_str(), 1); };
+
+    EXPECT_EQ("failed: Exec format error", outcome(SubProcess({dir.path("script")})));
+    EXPECT_EQ("failed: Exec format error", outcome(SubProcess({"script"}), searchThere));
+}
+
+TEST_P(ARunProgram, IsRefusedIfItsArgumentsAreTooLong) {
+    EXPECT_EQ("failed: Argument list too long", outcome(SubProcess({"true", std::string(16 * 1024 * 1024, 'x')})));
+}
+
+TEST_P(ARunProgram, IsRefusedIfATextCannotReachTheKernelWhole) {
+    const std::string nul("a\0b", 3);
+    std::vector<std::string> outcomes;
+    const auto refused = [&](const std::list<std::string>& argv, const std::function<void(SubProcess&)>& change) {
+        SubProcess process(argv);
+        process.setStdOutput(out, 0);
+        change(process);
+        outcomes.push_back(outcome(process));
+    };
+    const auto unchanged = [](SubProcess&) {};
+
+    refused({}, unchanged);
+    refused({""}, unchanged);
+    refused({"", "argument"}, unchanged);
+    refused({nul}, unchanged);
+    refused({std::string("/bin/true\0", 10)}, unchanged);
+    refused({"true", "argument", nul}, unchanged);
+    refused({"true"}, [&](SubProcess& process) { process.setEnv(nul, "value"); });
+    refused({"true"}, [&](SubProcess& process) { process.setEnv("NAME", nul); });
+    refused({"true"}, [&](SubProcess& process) { process.setEnv("", "value"); });
+    refused({"true"}, [&](SubProcess& process) { process.setEnv("NA=ME", "value"); });
+    refused({"true"}, [&](SubProcess& process) { process.setStdOutput(out + nul, 0); });
+    refused({"true"}, [&](SubProcess& process) { process.setStdError(out + nul, 0); });
+
+    EXPECT_EQ(std::vector<std::string>(12, "failed: Invalid argument"), outcomes);
+    EXPECT_FALSE(exists(out)) << "a refused program's output file was made";
+}
+
+// Where it is looked for.
+
+TEST_P(ARunProgram, IsTheFirstOfItsNameInPath) {
+    makeProgram(dir.path("1"), "other", "wrong");
+    makeProgram(dir.path("2"), "program", "second");
+    makeProgram(dir.path("3"), "program", "third");
+    const std::string path = dir.path("none") + ":" + dir.path("1") + ":" + dir.path("2") + "/:" + dir.path("3");
+    SubProcess process({"program"});
+
+    EXPECT_EQ("second\n", outputOf(process, [&] { setenv("PATH", path.c_str(), 1); }));
+}
+
+TEST_P(ARunProgram, IsNotAFolderOrAPlainFileInPath) {
+    makeProgram(dir.path("1"), "program", "wrong");
+    ASSERT_EQ(0, chmod(dir.path("1/program").c_str(), 0644));
+    mkdir(dir.path("2").c_str(), 0755);
+    mkdir(dir.path("2/program").c_str(), 0755);
+    makeProgram(dir.path("3"), "program", "right");
+    const std::string path = dir.path("1") + ":" + dir.path("2");
+    const auto searchTwo = [&] { setenv("PATH", path.c_str(), 1); };
+    const auto searchThree = [&] { setenv("PATH", (path + ":" + dir.path("3")).c_str(), 1); };
+    SubProcess process({"program"});
+
+    EXPECT_EQ("failed: Permission denied", outcome(process, searchTwo));
+    EXPECT_EQ("right\n", outputOf(process, searchThree));
+}
+
+TEST_P(ARunProgram, IsFoundInTheCurrentFolderWherePathHasAnEmptyPart) {
+    makeProgram(dir.path("here"), "program", "ran");
+    SubProcess process({"program"});
+
+    std::string expected;
+    for (const char* path : {"", ":/none", "/none:", "/none::/none"}) {
+        expected += "ran\n";
+        const auto searchHere = [&] {
+            setenv("PATH", path, 1);
+            EXPECT_EQ(0, chdir(dir.path("here").c_str()));
+        };
+        EXPECT_EQ(expected, outputOf(process, searchHere)) << "PATH=" << path;
+    }
+    const auto searchElsewhere = [&] {
+        setenv("PATH", "/none", 1);
+        EXPECT_EQ(0, chdir(dir.path("here").c_str()));
+    };
+    EXPECT_EQ("failed: No such file or directory", outcome(process, searchElsewhere));
+}
+
+TEST_P(ARunProgram, IsFoundInTheSystemsFoldersWithoutPath) {
+    EXPECT_EQ("exit 0", outcome(SubProcess({"true"}), [] { unsetenv("PATH"); }));
+}
+
+TEST_P(ARunProgram, IsLookedForInTheCallersPathAndNotItsOwn) {
+    makeProgram(dir.path("bin"), "program", "wrong");
+    SubProcess process({"program"});
+    process.setEnv("PATH", dir.path("bin"));
+
+    EXPECT_EQ("failed: No such file or directory", outcome(process));
+}
+
+// Its environment.
+
+TEST_P(ARunProgram, SeesTheCallersEnvironmentWithTheAdditions) {
+    SubProcess process({"/usr/bin/env"});
+    process.setEnv("REPLACED", "old");
+    process.setEnv("REPLACED", "new");
+    process.setEnv("ADDED", "a=b c");
+    process.setEnv("EMPTY", "");
+    char kept[] = "KEPT=1";
+    char once[] = "REPLACED=once";
+    char twice[] = "REPLACED=twice";
+    char similar[] = "REPLACED_NOT=2";
+    char odd[] = "ODD";
+    char* variables[] = {once, kept, similar, twice, odd, nullptr};
+
+    EXPECT_EQ("KEPT=1\nREPLACED_NOT=2\nODD\nADDED=a=b c\nEMPTY=\nREPLACED=new\n",
+              outputOf(process, [&] { environ = variables; }));
+}
+
+TEST_P(ARunProgram, SeesOnlyTheAdditionsOfACallerWithoutEnvironment) {
+    SubProcess process({"/usr/bin/env"});
+    process.setEnv("ADDED", "1");
+
+    EXPECT_EQ("ADDED=1\n", outputOf(process, [] { environ = nullptr; }));
+}
+
+TEST_P(ARunProgram, InheritsTheCallersFolderAndStreams) {
+    const auto moveAndRedirect = [this] {
+        EXPECT_EQ(0, chdir("/"));
+        dup2(open(out.c_str(), O_WRONLY | O_CREAT, 0600), STDOUT_FILENO);
+    };
+
+    EXPECT_EQ("exit 0", outcome(SubProcess(shell("pwd")), moveAndRedirect));
+    EXPECT_EQ("/\n", readFile(out));
+}
+
+// Its output files.
+
+TEST_P(ARunProgram, AppendsToItsOutputFiles) {
+    writeFile(out, "before\n");
+    SubProcess process(shell("echo out; echo err >&2"));
+    process.setStdOutput(out, 0);
+    process.setStdError(err, 0);
+
+    EXPECT_EQ("exit 0", outcome(process));
+    EXPECT_EQ("exit 0", outcome(process));
+
+    EXPECT_EQ("before\nout\nout\n", readFile(out));
+    EXPECT_EQ("err\nerr\n", readFile(err));
+}
+
+TEST_P(ARunProgram, MakesOutputFilesForItsOwnerAndGroup) {
+    SubProcess open({"true"});
+    open.setStdOutput(out, 0);
+    open.setStdError(err, 0);
+    SubProcess closed({"true"});
+    closed.setStdOutput(dir.path("closed"), 0);
+
+    EXPECT_EQ("exit 0", outcome(open, [] { umask(0); }));
+    EXPECT_EQ("exit 0", outcome(closed, [] { umask(077); }));
+
+    EXPECT_EQ(mode_t(0640), permissionsOf(out));
+    EXPECT_EQ(mode_t(0640), permissionsOf(err));
+    EXPECT_EQ(mode_t(0600), permissionsOf(dir.path("closed")));
+}
+
+TEST_P(ARunProgram, WritesBothStreamsToOneFileInOrder) {
+    const std::string otherName = dir.path("other_name");
+    writeFile(out, "");
+    ASSERT_EQ(0, link(out.c_str(), otherName.c_str()));
+    SubProcess process(shell("echo 1; echo 2 >&2; echo 3"));
+    process.setStdOutput(out, 0);
+
+    process.setStdError(out, 0);
+    EXPECT_EQ("exit 0", outcome(process));
+    EXPECT_EQ("1\n2\n3\n", readFile(out));
+
+    process.setStdError(otherName, 0);
+    EXPECT_EQ("exit 0", outcome(process));
+    EXPECT_EQ("1\n2\n3\n1\n2\n3\n", readFile(out));
+}
+
+TEST_P(ARunProgram, IsNotStartedIfAnOutputFileCannotBeOpened) {
+    const std::string ran = dir.path("ran");
+    const std::vector<std::pair<std::string, std::string>> outcomes = {
+        {dir.path("missing/file"), "failed: No such file or directory"},
+        {dir.path(), "failed: Is a directory"},
+        {"", "failed: No such file or directory"},
+    };
+    for (const auto& [path, expected] : outcomes) {
+        SubProcess output({"touch", ran});
+        output.setStdOutput(path, 0);
+        EXPECT_EQ(expected, outcome(output)) << "output: " << path;
+
+        SubProcess error({"touch", ran});
+        error.setStdError(path, 0);
+        EXPECT_EQ(expected, outcome(error)) << "error output: " << path;
+    }
+    EXPECT_FALSE(exists(ran));
+}
+
+// What it starts with.
+
+TEST_P(ARunProgram, StartsWithDefaultSignalsAndNoneBlocked) {
+    SubProcess process({"cat", "/proc/self/status"});
+
+    const std::string status = outputOf(process, changeAllSignals);
+
+    EXPECT_EQ("0000000000000000", field(status, "SigBlk:"));
+    EXPECT_EQ("0000000000000000", field(status, "SigIgn:"));
+    EXPECT_EQ("0000000000000000", field(status, "SigCgt:"));
+}
+
+TEST_P(ARunProgram, LeadsAProcessGroupOfItsOwn) {
+    SubProcess process(shell("read pid name state parent group rest < /proc/$$/stat; echo $((group - $$))"));
+    EXPECT_EQ("0\n", outputOf(process));
+}
+
+TEST_P(ARunProgram, HasNoDescriptorButTheStandardOnes) {
+    SubProcess process({"ls", "/proc/self/fd"});
+
+    EXPECT_EQ("0\n1\n2\n3\n", outputOf(process, openMoreDescriptors)); // 3 is the folder that ls reads
+}
+
+// close_range() came with Linux 5.9, and its close-on-exec flag with 5.11.
+TEST_P(ARunProgram, HasNoOtherDescriptorAlsoOnAnOldKernel) {
+    for (const int answer : {ENOSYS, EINVAL}) {
+        SubProcess process({"ls", "/proc/self/fd"});
+        const auto runOnOldKernel = [=] {
+            openMoreDescriptors();
+            support::refuseSystemCalls({SYS_close_range}, answer);
+        };
+
+        EXPECT_EQ("0\n1\n2\n3\n", outputOf(process, runOnOldKernel));
+        unlink(out.c_str());
+    }
+}
+
+TEST_P(ARunProgram, HasItsOutputInPlaceIfTheCallerHasNoStandardStreams) {
+    SubProcess both(shell("echo out; echo err >&2"));
+    both.setStdOutput(out, 0);
+    both.setStdError(err, 0);
+    EXPECT_EQ("exit 0", outcome(both, closeStandardDescriptors));
+    EXPECT_EQ("out\n", readFile(out));
+    EXPECT_EQ("err\n", readFile(err));
+
+    SubProcess onlyError(shell("echo more >&2"));
+    onlyError.setStdError(err, 0);
+    EXPECT_EQ("exit 0", outcome(onlyError, closeStandardDescriptors));
+    EXPECT_EQ("err\nmore\n", readFile(err));
+}
+
+TEST_P(ARunProgram, HasNoStreamThatTheCallerHasNotUnlessItIsSet) {
+    const std::string both = dir.path("both");
+    SubProcess shared(shell(LIST_DESCRIPTORS));
+    shared.setStdOutput(both, 0);
+    shared.setStdError(both, 0);
+    SubProcess output(shell(LIST_DESCRIPTORS));
+    output.setStdOutput(out, 0);
+    SubProcess error(shell("exec 1>&2; " + std::string(LIST_DESCRIPTORS)));
+    error.setStdError(err, 0);
+    for (const SubProcess* process : {&shared, &output, &error}) {
+        EXPECT_EQ("exit 0", outcome(*process, closeStandardDescriptors));
+    }
+
+    EXPECT_EQ("1\n2\n", readFile(both));
+    EXPECT_EQ("1\n", readFile(out));
+    EXPECT_EQ("1\n2\n", readFile(err)); // 1 is the shell's own doing
+}
+
+TEST_P(ARunProgram, MayFindOneStandardStreamClosed) {
+    for (const int closed : {0, 1, 2}) {
+        const std::string file = dir.path("without" + std::to_string(closed));
+        SubProcess process(shell("echo out; echo err >&2"));
+        process.setStdOutput(file, 0);
+        process.setStdError(file, 0);
+
+        EXPECT_EQ("exit 0", outcome(process, [=] { close(closed); }));
+        EXPECT_EQ("out\nerr\n", readFile(file)) << closed;
+    }
+}
+
+// What call() alone promises.
+
+namespace {
+
+int announcedTicks = 0;
+int tickListener = -1;
+
+/** Counts the ticks, and writes a line to the listener at the hundredth. */
+void countTick(int) {
+    const int problem = errno;
+    if (++announcedTicks == 100 && write(tickListener, "\n", 1) != 1) {
+        _exit(2);
+    }
+    errno = problem;
+}
+
+bool forked = false;
+
+} // namespace
+
+TEST(ACaller, WaitsForTheProgramWhateverSignalsArrive) {
+    const TempDir dir;
+    const std::string fifo = dir.path("fifo");
+    ASSERT_EQ(0, mkfifo(fifo.c_str(), 0600));
+
+    const int status = runInChild([&] {
+        tickListener = open(fifo.c_str(), O_RDWR | O_CLOEXEC);
+        handle(SIGALRM, countTick);
+        const itimerval everyMillisecond = {{0, 1000}, {0, 1000}};
+        setitimer(ITIMER_REAL, &everyMillisecond, nullptr);
+        const int result = SubProcess(shell("read line < " + fifo + "; exit 5")).call();
+        return WIFEXITED(result) ? WEXITSTATUS(result) : 1;
+    });
+
+    EXPECT_EQ("exit 5", describeStatus(status));
+}
+
+TEST(ACaller, IsToldIfItKeepsNoStatusOfItsChildren) {
+    const int status = runInChild([] {
+        handle(SIGCHLD, SIG_IGN);
+        return SubProcess({"true"}).call() == -1 && errno == ECHILD ? 0 : 1;
+    });
+
+    EXPECT_EQ("exit 0", describeStatus(status));
+}
+
+TEST(ACaller, IsNotForked) {
+    const int status = runInChild([] {
+        pthread_atfork([] { forked = true; }, nullptr, nullptr);
+        const int result = SubProcess({"true"}).call();
+        return result == 0 && !forked ? 0 : 1;
+    });
+
+    EXPECT_EQ("exit 0", describeStatus(status));
+}
+
+TEST(ACaller, KeepsItsSignalsItsDescriptorsAndItsEnvironment) {
+    const TempDir dir;
+    const int status = runInChild([&] {
+        sigset_t blocked;
+        sigemptyset(&blocked);
+        sigaddset(&blocked, SIGUSR1);
+        sigprocmask(SIG_SETMASK, &blocked, nullptr);
+        handle(SIGPIPE, SIG_IGN);
+        openMoreDescriptors();
+        setenv("NAME", "ours", 1);
+        const std::string before = readFile("/proc/self/status");
+        SubProcess process({"true"});
+        process.setEnv("NAME", "its");
+        process.setStdOutput(dir.path("out"), 0);
+        if (process.call() != 0) {
+            return 1;
+        }
+        const std::string after = readFile("/proc/self/status");
+        const bool signalsKept =
+            field(before, "SigBlk:") == field(after, "SigBlk:") && field(before, "SigIgn:") == field(after, "SigIgn:");
+        const bool descriptorsKept = fcntl(200, F_GETFD) == 0 && write(STDOUT_FILENO, "", 0) == 0;
+        return signalsKept && descriptorsKept && getenv("NAME") == std::string("ours") ? 0 : 2;
+    });
+
+    EXPECT_EQ("exit 0", describeStatus(status));
+    EXPECT_EQ("", readFile(dir.path("out")));
+}
+
+TEST(ACaller, LeavesNoChildAndNoDescriptorBehind) {
+    const TempDir dir;
+    const int status = runInChild([&] {
+        const int before = dup(STDOUT_FILENO);
+        close(before);
+        SubProcess process({"true"});
+        process.setStdOutput(dir.path("out"), 0);
+        SubProcess failing({"true"});
+        failing.setStdOutput(dir.path("missing/out"), 0);
+        if (process.call() != 0 || failing.call() != -1) {
+            return 1;
+        }
+        return dup(STDOUT_FILENO) == before && waitpid(-1, nullptr, WNOHANG) == -1 && errno == ECHILD ? 0 : 2;
+    });
+
+    EXPECT_EQ("exit 0", describeStatus(status));
+}
+
+// What exec() alone promises.
+
+TEST(AReplacedProcess, KeepsItsId) {
+    const TempDir dir;
+    SubProcess process(shell("echo $$"));
+    process.setStdOutput(dir.path("out"), 0);
+    const pid_t child = support::startInChild([&] { return process.exec(); });
+
+    EXPECT_EQ("exit 0", describeStatus(support::waitForChild(child)));
+    EXPECT_EQ(std::to_string(child) + "\n", readFile(dir.path("out")));
+}
+
+TEST(AReplacedProcess, EndsBySignalsThatWereHeldBack) {
+    const TempDir dir;
+    const int status = runInChild([&] {
+        handle(SIGTERM, ignoreSignalHandled);
+        sigset_t blocked;
+        sigemptyset(&blocked);
+        sigaddset(&blocked, SIGTERM);
+        sigprocmask(SIG_BLOCK, &blocked, nullptr);
+        raise(SIGTERM);
+        return SubProcess({"touch", dir.path("ran")}).exec();
+    });
+
+    EXPECT_EQ("signal 15", describeStatus(status));
+    EXPECT_FALSE(exists(dir.path("ran")));
+}

@@ -1,0 +1,45 @@
+#pragma once
+
+#include <stdlib.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <string>
+#include <system_error>
+
+namespace support {
+
+/**
+ * A fresh, empty folder below $TMPDIR (or /tmp), mode 0700, removed with all
+ * that is in it at the end of the object's life. Its path has no trailing slash.
+ */
+class TempDir {
+public:
+    TempDir() {
+        const char* base = getenv("TMPDIR");
+        folder = std::string(base && *base ? base : "/tmp") + "/marubackup-test-XXXXXX";
+        if (!mkdtemp(&folder[0])) {
+            throw std::system_error(errno, std::generic_category(), "mkdtemp " + folder);
+        }
+    }
+    ~TempDir() {
+        std::error_code ignored;
+        std::filesystem::remove_all(folder, ignored);
+    }
+    TempDir(const TempDir&) = delete;
+    TempDir& operator=(const TempDir&) = delete;
+
+    /** The folder itself. */
+    const std::string& path() const {
+        return folder;
+    }
+    /** `name` inside the folder; nothing is made. */
+    std::string path(const std::string& name) const {
+        return folder + "/" + name;
+    }
+
+private:
+    std::string folder;
+};
+
+} // namespace support
