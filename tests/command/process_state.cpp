@@ -1,0 +1,46 @@
+#include "process_state.h"
+
+#include <sys/syscall.h>
+
+#include <algorithm>
+#include <sstream>
+#include <string>
+
+#include "support/files.h"
+#include "support/waiting.h"
+
+BlockedCall blockedCall(pid_t pid) {
+    std::istringstream fields(support::readFile("/proc/" + std::to_string(pid) + "/syscall"));
+    BlockedCall call;
+    std::string descriptor;
+    std::string buffer;
+    std::string size;
+    if (fields >> call.number >> descriptor >> buffer >> size) {
+        call.size = std::stoul(size, nullptr, 16);
+        return call;
+    }
+    return BlockedCall();
+}
+
+bool waitUntilBlockedIn(pid_t pid, const std::vector<long>& numbers) {
+    return support::waitUntil([pid, &numbers]() {
+        return std::find(numbers.begin(), numbers.end(), blockedCall(pid).number) != numbers.end();
+    });
+}
+
+bool waitUntilLoopSleeps(pid_t pid) {
+    return waitUntilBlockedIn(pid, {
+#ifdef SYS_epoll_wait
+                                       SYS_epoll_wait,
+#endif
+#ifdef SYS_epoll_pwait2
+                                       SYS_epoll_pwait2,
+#endif
+                                       SYS_epoll_pwait});
+}
+
+long timesSlept(pid_t pid) {
+    const std::string status = support::readFile("/proc/" + std::to_string(pid) + "/status");
+    const std::string field = "\nvoluntary_ctxt_switches:";
+    return std::stol(status.substr(status.find(field) + field.size()));
+}
