@@ -1,0 +1,295 @@
+#include "queue/requests.h"
+
+#include <syslog.h>
+
+#include <json/value.h>
+
+#include <marubackup/backend_manager.h>
+#include <marubackup/job.h>
+#include <marubackup/system_status.h>
+
+#include "command/protocol.h"
+#include "common/json_text.h"
+#include "queue/job_queues.h"
+#include "queue/queue_log.h"
+#include "queue/queue_server.h"
+
+namespace MARU {
+namespace Backup {
+
+namespace {
+
+void refuse(Json::Value& reply, ReplyCode code) {
+    reply[Member::CODE] = code;
+}
+
+/** The id that a request names; 0, which is no job's, if it names none. */
+int requestedJobId(const Json::Value& request) {
+    const Json::Value& id = member(request, Member::JOB_ID);
+    return isInt32(id) && id.asInt() > 0 ? id.asInt() : 0;
+}
+
+// job_enqueue
+
+/** Reads the job that a client wants done. False if there is none worth a look. */
+bool readCandidate(const Json::Value& request, Job& job) {
+    const Json::Value& json = member(request, Member::JOB);
+    if (!json.isObject() || !job.fromJson(json) || !Job::isValidToEnqueue(job)) {
+        return false;
+    }
+    // In a list it stands two levels down. One that no client could read there
+    // would spoil the lists of all.
+    if (nestingOf(json) > MAX_NESTING - 2) {
+        return false;
+    }
+    // It has no process yet, whatever the client says: removing it while it
+    // waits must not signal a process of the client's choosing.
+    job.setPid(-1);
+    return true;
+}
+
+void handleJobEnqueue(const Json::Value& request, Json::Value& reply, CommandServer*) {
+    Job job;
+    if (!readCandidate(request, job)) {
+        return refuse(reply, CODE_BAD_REQUEST);
+    }
+    const std::string queueName = action2str(job.getAction());
+    BackendManager backend;
+    if (!backend.load(job.getBackend(), queueName)) {
+        queueLog(LOG_ERR, "backend [%s] not support", job.getBackend().c_str());
+        return refuse(reply, CODE_NOT_SUPPORTED);
+    }
+    if (!backend.check(job)) {
+        queueLog(LOG_ERR, "invalid job");
+        return refuse(reply, CODE_BAD_REQUEST);
+    }
+    if (backend.getUniqueFormat().empty()) {
+        queueLog(LOG_ERR, "backend [%s] bad unique", job.getBackend().c_str());
+        return refuse(reply, CODE_NOT_SUPPORTED);
+    }
+    if (!queue_is_empty(action2str(Job::ACTION_RESTORE))) {
+        queueLog(LOG_ERR, "restore queue is not empty");
+        return refuse(reply, CODE_RESTORE_PENDING);
+    }
+    if (System::isRestoreRunningNotQueued("")) {
+        queueLog(LOG_ERR, "restore job running");
+        return refuse(reply, CODE_RESTORE_PENDING);
+    }
+    // A job refused from here on leaves a gap in the ids, so that no id is ever
+    // seen on two jobs.
+    job.setJobId(queue_take_job_id());
+    job.setStatus(Job::STATUS_QUEUED);
+    job.setUniqueString(backend.getJobUnique(job));
+    if (queue_is_same_unique(job)) {
+        queueLog(LOG_ERR, "job unique conflict [%s]", job.getUniqueString().c_str());
+        return refuse(reply, CODE_CONFLICT);
+    }
+    queueLog(LOG_INFO, "enqueue job [%s]", job.toString().c_str());
+    jobQueues[queueName].push_back(job);
+    queue_scan_next_to_launch();
+    reply[Member::JOB] = job.toJson();
+}
+
+// job_get
+
+QueueIterControl getJobCb(const std::string&, Job& job, bool&, void* arg) {
+    Job& wanted = *static_cast<Job*>(arg);
+    if (wanted.getJobId() < 0) {
+        return QUEUE_ITER_STOP;
+    }
+    if (job.getJobId() != wanted.getJobId()) {
+        return QUEUE_ITER_CONTINUE;
+    }
+    wanted = job;
+    return QUEUE_ITER_STOP;
+}
+
+void handleJobGet(const Json::Value& request, Json::Value& reply, CommandServer*) {
+    const int id = requestedJobId(request);
+    if (id == 0) {
+        refuse(reply, CODE_BAD_REQUEST);
+        queueLog(LOG_ERR, "bad job get request");
+        return;
+    }
+    Job job;
+    job.setJobId(id);
+    queue_foreach_job(getJobCb, &job);
+    if (job.getStatus() == Job::STATUS_NONE) {
+        return refuse(reply, CODE_NOT_FOUND);
+    }
+    reply[Member::JOB] = job.toJson();
+}
+
+// job_remove
+
+/** `arg` points at the id of the job to remove, and is set to 0 when it is found. */
+QueueIterControl removeJobCb(const std::string& queueName, Job& job, bool& removeJob, void* arg) {
+    int& id = *static_cast<int*>(arg);
+    if (id < 0) {
+        return QUEUE_ITER_STOP;
+    }
+    if (job.getJobId() != id) {
+        return QUEUE_ITER_CONTINUE;
+    }
+    sendSignalCb(queueName, job, removeJob, nullptr);
+    id = 0;
+    return QUEUE_ITER_STOP;
+}
+
+void handleJobRemove(const Json::Value& request, Json::Value& reply, CommandServer*) {
+    int id = requestedJobId(request);
+    if (id == 0) {
+        queueLog(LOG_ERR, "bad job remove request");
+        return refuse(reply, CODE_BAD_REQUEST);
+    }
+    queueLog(LOG_INFO, "remove job [%d]", id);
+    queue_foreach_job(removeJobCb, &id);
+    if (id != 0) {
+        refuse(reply, CODE_NOT_FOUND);
+    }
+}
+
+// job_list
+
+/** Which jobs a client wants listed; an empty text filters nothing. */
+struct ListFilter {
+    std::list<std::string> queueNames;
+    std::string backend;
+    std::string unique;
+    std::string format;
+    std::string target;
+
+    bool takes(const Job& job) const {
+        return (unique.empty() || unique == job.getUniqueString()) &&
+               (backend.empty() || backend == job.getBackend()) &&
+               (format.empty() || target.empty() || job.toFormatString(format) == target);
+    }
+};
+
+/** Reads an optional text. False if the member is there and is none. */
+bool readText(const Json::Value& request, const char* name, std::string& text) {
+    if (!request.isMember(name)) {
+        return true;
+    }
+    const Json::Value& value = member(request, name);
+    if (!value.isString()) {
+        return false;
+    }
+    text = value.asString();
+    return true;
+}
+
+bool readQueueNames(const Json::Value& request, std::list<std::string>& queueNames) {
+    if (!request.isMember(Member::ACTION)) {
+        for (const auto& entry : jobQueues) {
+            queueNames.push_back(entry.first);
+        }
+        return true;
+    }
+    const Json::Value& action = member(request, Member::ACTION);
+    if (!isInt32(action)) {
+        return false;
+    }
+    queueNames.push_back(action2str(static_cast<Job::Action>(action.asInt())));
+    return true;
+}
+
+/** Reads the two texts that work as a pair only. */
+bool readFormat(const Json::Value& request, ListFilter& filter) {
+    if (!request.isMember(Member::FORMAT) || !request.isMember(Member::TARGET)) {
+        return true;
+    }
+    return readText(request, Member::FORMAT, filter.format) && readText(request, Member::TARGET, filter.target);
+}
+
+/** The member that cannot be used, or null if the whole filter was read. */
+const char* readFilter(const Json::Value& request, ListFilter& filter) {
+    if (!readQueueNames(request, filter.queueNames)) {
+        return Member::ACTION;
+    }
+    if (!readFormat(request, filter)) {
+        return Member::FORMAT;
+    }
+    if (!readText(request, Member::BACKEND, filter.backend)) {
+        return Member::BACKEND;
+    }
+    if (!readText(request, Member::UNIQUE, filter.unique)) {
+        return Member::UNIQUE;
+    }
+    return nullptr;
+}
+
+void handleJobList(const Json::Value& request, Json::Value& reply, CommandServer*) {
+    ListFilter filter;
+    if (const char* bad = readFilter(request, filter)) {
+        queueLog(LOG_ERR, "bad list param: %s", bad);
+        return refuse(reply, CODE_BAD_REQUEST);
+    }
+    Json::Value& jobs = reply[Member::JOBS] = Json::Value(Json::arrayValue);
+    for (const std::string& name : filter.queueNames) {
+        for (const Job& job : jobQueues[name]) {
+            if (!filter.takes(job)) {
+                continue;
+            }
+            jobs.append(job.toJson());
+            if (!filter.unique.empty()) {
+                return;
+            }
+        }
+    }
+}
+
+// Dispatch
+
+struct OpHandler {
+    const char* op;
+    void (*handle)(const Json::Value& request, Json::Value& reply, CommandServer* server);
+};
+
+const OpHandler opHandlerTable[] = {
+    {Op::JOB_ENQUEUE, handleJobEnqueue},
+    {Op::JOB_REMOVE, handleJobRemove},
+    {Op::JOB_GET, handleJobGet},
+    {Op::JOB_LIST, handleJobList},
+};
+
+const OpHandler* findHandler(const std::string& op) {
+    for (const OpHandler& row : opHandlerTable) {
+        if (op == row.op) {
+            return &row;
+        }
+    }
+    return nullptr;
+}
+
+void answer(const std::string& text, Json::Value& reply, CommandServer* server) {
+    Json::Value request;
+    const bool parsed = fromString(text, request);
+    const Json::Value& op = member(request, Member::OP);
+    if (!parsed || !op.isString()) {
+        queueLog(LOG_ERR, "bad command: [%s]", text.c_str());
+        return refuse(reply, CODE_BAD_REQUEST);
+    }
+    const OpHandler* const handler = findHandler(op.asString());
+    if (handler == nullptr) {
+        queueLog(LOG_ERR, "handler [%s] not found", op.asCString());
+        return refuse(reply, CODE_UNKNOWN_OP);
+    }
+    handler->handle(request, reply, server);
+    if (!reply.isMember(Member::CODE)) {
+        reply[Member::CODE] = CODE_OK;
+    }
+}
+
+} // namespace
+
+std::string dispatchRequest(const char* data, unsigned int length, CommandServer* server) {
+    const std::string text(data, length);
+    queueLog(LOG_DEBUG, "request [%s]", text.c_str());
+    Json::Value reply;
+    answer(text, reply, server);
+    return toString(reply);
+}
+
+} // namespace Backup
+} // namespace MARU
