@@ -1,0 +1,224 @@
+#include "options.h"
+
+#include <algorithm>
+#include <charconv>
+#include <memory>
+#include <sstream>
+
+#include <CLI/CLI.hpp>
+
+#include "output.h"
+#include "parameter.h"
+#include "words.h"
+
+namespace {
+
+const char EXIT_STATUSES[] = R"(Exit status:
+  0    done
+  1    something else failed
+  2    wrong usage
+  3    no such job
+  4    refused by a rule of the daemon or the backend
+  5    the daemon cannot be reached
+  124  timed out
+  130  interrupted
+"marubackupctl VERB --help" tells more. Options may stand before or after the verb.)";
+
+const char MORE[] = "\"marubackupctl --help\" has the options of all verbs and the exit statuses.";
+
+const std::string HINT = " (see \"marubackupctl --help\")";
+
+const double LONGEST_TIME = 1e8;
+
+// Validators: empty if the text will do, otherwise what is wrong with it.
+
+std::string checkJobId(const std::string& text) {
+    int jobId = 0;
+    const char* end = text.data() + text.size();
+    const auto [rest, error] = std::from_chars(text.data(), end, jobId);
+    return error == std::errc() && rest == end && jobId > 0 ? "" : "\"" + text + "\" is no job id: a number from 1 up";
+}
+
+std::string checkSeconds(const std::string& text) {
+    double seconds = 0;
+    const char* end = text.data() + text.size();
+    const auto [rest, error] = std::from_chars(text.data(), end, seconds);
+    const bool good = error == std::errc() && rest == end && seconds >= 0 && seconds <= LONGEST_TIME;
+    return good ? "" : "\"" + text + "\" is no number of seconds";
+}
+
+std::string checkTimeout(const std::string& text) {
+    const std::string mistake = checkSeconds(text);
+    return mistake.empty() && std::stod(text) <= 0 ? "must be more than 0 seconds" : mistake;
+}
+
+std::string checkNotEmpty(const std::string& text) {
+    return text.empty() ? "must not be empty" : "";
+}
+
+std::string checkParameter(const std::string& text) {
+    Json::Value ignored(Json::objectValue);
+    return readParameter(text, ignored);
+}
+
+std::vector<std::string> actionNames() {
+    std::vector<std::string> names;
+    for (const Job::Action action : ACTIONS) {
+        names.push_back(action2str(action));
+    }
+    return names;
+}
+
+/** Ids are decimal: CLI11 would read 010 as 8. */
+int toJobId(const std::string& text) {
+    return std::stoi(text);
+}
+
+std::vector<int> toJobIds(const std::vector<std::string>& texts) {
+    std::vector<int> jobIds(texts.size());
+    std::transform(texts.begin(), texts.end(), jobIds.begin(), toJobId);
+    return jobIds;
+}
+
+void addJobIds(CLI::App& verb, std::vector<std::string>& texts) {
+    verb.add_option("ID", texts, "job ids")->option_text("...")->required()->check(checkJobId);
+}
+
+CLI::App* addVerb(CLI::App& app, const std::string& name, const std::string& description,
+                  const std::string& details = "") {
+    CLI::App* verb = app.add_subcommand(name, description);
+    verb->group("Verbs");
+    verb->footer(details + (details.empty() ? "" : "\n") + MORE);
+    verb->get_help_ptr()->description("print this help and exit");
+    return verb;
+}
+
+void defineGlobals(CLI::App& app, Globals& globals) {
+    app.fallthrough();
+    app.require_subcommand(1);
+    app.footer(EXIT_STATUSES);
+    app.get_formatter()->label("SUBCOMMAND", "VERB");
+    app.get_help_ptr()->description("print this help and exit");
+    app.set_version_flag("--version", "marubackupctl " MARUBACKUP_VERSION, "print the version and exit");
+    app.add_flag("--json", globals.json, "write data as one line of JSON; a failure as {\"code\":…,\"reason\":…}");
+    app.add_option("--timeout", globals.timeout, "the longest that one exchange with the daemon may take")
+        ->option_text("SECONDS (10)")
+        ->check(checkTimeout);
+}
+
+void defineAdd(CLI::App& app, Options& options) {
+    CLI::App* verb = addVerb(app, "add", "put a job into the queue, and print its id",
+                             "ACTION is one of " + joined(actionNames(), ", ") + ".");
+    const auto add = std::make_shared<AddVerb>();
+    verb->add_option("BACKEND", add->backend, "the backend that does the work (\"marubackupctl backends\")")
+        ->option_text(" ")
+        ->required()
+        ->check(checkNotEmpty);
+    verb->add_option("ACTION", add->action, "what it does")
+        ->option_text(" ")
+        ->required()
+        ->check(CLI::IsMember(actionNames()));
+    verb->add_option("--branch", add->branch, "run the backend's command_BRANCH, not its command_launch")
+        ->option_text("BRANCH");
+    const auto parameters = std::make_shared<std::vector<std::string>>();
+    verb->add_option("-p,--param", *parameters, "a parameter of the job, a text or any JSON value; may be repeated")
+        ->option_text("NAME=TEXT | NAME:=JSON")
+        ->allow_extra_args(false)
+        ->check(checkParameter);
+    verb->callback([&options, add, parameters] {
+        for (const std::string& parameter : *parameters) {
+            readParameter(parameter, add->parameters);
+        }
+        options.verb = *add;
+    });
+}
+
+void defineList(CLI::App& app, Options& options) {
+    CLI::App* verb = addVerb(app, "list", "list the jobs that wait or run");
+    const auto list = std::make_shared<ListVerb>();
+    verb->add_option("--action", list->action, "only those of this action")
+        ->option_text("ACTION")
+        ->check(CLI::IsMember(actionNames()));
+    verb->add_option("--backend", list->backend, "only those of this backend")
+        ->option_text("BACKEND")
+        ->check(checkNotEmpty);
+    verb->add_option("--unique", list->unique, "only the one with this unique string")
+        ->option_text("TEXT")
+        ->check(checkNotEmpty);
+    CLI::Option* format = verb->add_option("--format", list->format,
+                                           "only those for which this template, such as "
+                                           "{{BACKEND}} or a parameter's {{name}}, …")
+                              ->option_text("TEMPLATE")
+                              ->check(checkNotEmpty);
+    CLI::Option* target =
+        verb->add_option("--target", list->target, "… expands to this text")->option_text("TEXT")->check(checkNotEmpty);
+    format->needs(target);
+    target->needs(format);
+    verb->callback([&options, list] { options.verb = *list; });
+}
+
+void defineShow(CLI::App& app, Options& options) {
+    CLI::App* verb = addVerb(app, "show", "show one job with its parameters");
+    const auto text = std::make_shared<std::string>();
+    verb->add_option("ID", *text, "the job's id")->option_text(" ")->required()->check(checkJobId);
+    verb->callback([&options, text] { options.verb = ShowVerb{toJobId(*text)}; });
+}
+
+void defineRemove(CLI::App& app, Options& options) {
+    CLI::App* verb = addVerb(app, "remove", "remove jobs, running ones too",
+                             "A waiting job is gone at once. A running one is sent SIGTERM, and is listed as stopping\n"
+                             "until its process has ended. Of several failures the worst gives the exit status.");
+    const auto texts = std::make_shared<std::vector<std::string>>();
+    addJobIds(*verb, *texts);
+    verb->callback([&options, texts] { options.verb = RemoveVerb{toJobIds(*texts)}; });
+}
+
+void defineWait(CLI::App& app, Options& options) {
+    CLI::App* verb = addVerb(app, "wait", "wait until jobs have ended",
+                             "A job that the daemon does not know counts as ended: a short one may be gone before the\n"
+                             "wait begins. Whether it did its work is in the files that its backend writes.");
+    const auto longest = std::make_shared<std::optional<double>>();
+    verb->add_option("--for", *longest, "the longest that the whole wait may take, then exit status 124")
+        ->option_text("SECONDS")
+        ->check(checkSeconds);
+    const auto texts = std::make_shared<std::vector<std::string>>();
+    addJobIds(*verb, *texts);
+    verb->callback([&options, texts, longest] { options.verb = WaitVerb{toJobIds(*texts), *longest}; });
+}
+
+void defineBackends(CLI::App& app, Options& options) {
+    CLI::App* verb =
+        addVerb(app, "backends", "list the installed backends and what they can do",
+                "These are the files in /usr/maru/share/marubackup, each hidden by one of the same name in\n"
+                "/usr/local/share/marubackup. DELEGATE names the actions for which one is a delegate.");
+    verb->callback([&options] { options.verb = BackendsVerb(); });
+}
+
+} // namespace
+
+std::optional<int> readOptions(int argc, char** argv, Options& options) {
+    CLI::App app("Asks the backup queue daemon, marubackupd, to do jobs, and about them.\n"
+                 "Data goes to standard output, everything else to standard error.");
+    defineGlobals(app, options.globals);
+    defineAdd(app, options);
+    defineList(app, options);
+    defineShow(app, options);
+    defineRemove(app, options);
+    defineWait(app, options);
+    defineBackends(app, options);
+    try {
+        app.parse(argc, argv);
+        return std::nullopt;
+    } catch (const CLI::ParseError& end) {
+        std::ostringstream out;
+        std::ostringstream err;
+        if (app.exit(end, out, err) == 0) {
+            putData(out.str());
+            return EXIT_DONE;
+        }
+        const bool noVerb =
+            end.get_exit_code() == static_cast<int>(CLI::ExitCodes::RequiredError) && app.get_subcommands().empty();
+        say((noVerb ? "a verb is missing, or is none of those that there are" : end.what()) + HINT);
+        return EXIT_USAGE;
+    }
+}

@@ -1,0 +1,27 @@
+#pragma once
+
+#include <string>
+
+/** What to write, and the exit status, when the process is ended at an unforeseen point. */
+struct LastWords {
+    std::string data;    ///< to standard output
+    std::string message; ///< to standard error
+    int status = 0;
+};
+
+/**
+ * Guards a call into the library, which has no time-out: as long as the object
+ * lives, the process is ended when `seconds` have passed, with `late`, or when
+ * the daemon has gone, with `gone`. (A call whose daemon went away in the middle
+ * of it would not return.) One at a time.
+ */
+class Watchdog {
+public:
+    Watchdog(double seconds, const LastWords& late, const LastWords& gone);
+    ~Watchdog();
+    Watchdog(const Watchdog&) = delete;
+    Watchdog& operator=(const Watchdog&) = delete;
+};
+
+/** Ends the process with `words` on SIGINT, unless whoever started it ignores that signal. */
+void endOnInterrupt(const LastWords& words);
