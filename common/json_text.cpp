@@ -21,7 +21,8 @@ std::unique_ptr<Json::CharReader> newReader() {
     builder["rejectDupKeys"] = false;
     builder["skipBom"] = false;
     builder["collectComments"] = false;
-    builder["stackLimit"] = MAX_NESTING;
+    // It counts the innermost value as a level of its own.
+    builder["stackLimit"] = MAX_NESTING + 1;
     return std::unique_ptr<Json::CharReader>(builder.newCharReader());
 }
 
@@ -88,6 +89,16 @@ bool skipString(const std::string& text, std::size_t& at) {
     return true;
 }
 
+/** Follows the brackets outside of strings; false at one that opens a level too many. */
+bool countNesting(char c, int& depth) {
+    if (c == '[' || c == '{') {
+        ++depth;
+    } else if (c == ']' || c == '}') {
+        --depth;
+    }
+    return depth <= MAX_NESTING;
+}
+
 /**
  * jsoncpp reads numbers like 01, 1. and +1, raw control characters in strings,
  * comments in some places also where they are not allowed, and takes a NUL for
@@ -95,9 +106,10 @@ bool skipString(const std::string& text, std::size_t& at) {
  * reader's to judge.
  */
 bool hasOnlyStandardTokens(const std::string& text) {
+    int depth = 0;
     for (std::size_t at = 0; at < text.size();) {
         const char c = text[at];
-        if (c == '\0' || c == '/') {
+        if (c == '\0' || c == '/' || !countNesting(c, depth)) {
             return false;
         }
         if (c == '"') {

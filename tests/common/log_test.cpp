@@ -83,6 +83,17 @@ TEST(LocatedLog, LeavesErrnoAsItWasWhereNobodyListens) {
     EXPECT_EQ("exit 0", support::describeStatus(status));
 }
 
+TEST(LocatedLog, LeavesErrnoAsItWasWhenALineIsTooLongToBeSent) {
+    support::SyslogSocket log;
+    const std::string text(4 << 20, 'x');
+
+    errno = EACCES;
+    LOG_LOCATED_ERR("lost: %s", text.c_str());
+
+    EXPECT_EQ(EACCES, errno);
+    EXPECT_TRUE(log.lines().empty());
+}
+
 TEST(LocatedLog, NamesTheProcessThatLogs) {
     support::SyslogSocket log;
 
@@ -110,8 +121,10 @@ TEST(LocatedLog, KeepsALongArgumentWhole) {
     const std::string text(16380, 'x');
 
     LOG_LOCATED_ERR("bad text [%s]", text.c_str());
+    const int line = __LINE__ - 1;
 
-    support::expectLocated(log, LOG_ERR, getpid(), LOG_UNIT, "bad text [" + text + "]");
+    ASSERT_EQ(1U, log.lines().size());
+    EXPECT_EQ(located(getpid(), "err", line, "bad text [" + text + "]"), log.lines()[0].message);
 }
 
 TEST(LocatedLog, KeepsTheLinesOfSeveralThreadsApart) {
