@@ -2,6 +2,8 @@
 #include <unistd.h>
 
 #include <ostream>
+#include <sstream>
+#include <tuple>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -21,6 +23,10 @@ namespace {
 const char* const WRITE_ENVIRONMENT = "/bin/sh -c 'tr \"\\0\" \"\\n\" < /proc/$$/environ | sort > {{out}}'";
 
 enum class Way { CHECK, LAUNCH };
+
+std::ostream& operator<<(std::ostream& out, Way way) {
+    return out << (way == Way::CHECK ? "Check" : "Launch");
+}
 
 /** What a section sets in its command's environment, of the variables that begin with "MB_". */
 struct Setting {
@@ -92,9 +98,9 @@ const Setting SETTINGS[] = {
 INSTANTIATE_TEST_SUITE_P(Of, BackendEnvironment,
                          testing::Combine(testing::Values(Way::CHECK, Way::LAUNCH), testing::ValuesIn(SETTINGS)),
                          [](const auto& row) {
-                             const bool check = std::get<Way>(row.param) == Way::CHECK;
-                             return std::string(check ? "Check" : "Launch") + "With" +
-                                    std::get<Setting>(row.param).name;
+                             std::ostringstream name;
+                             name << std::get<Way>(row.param) << "With" << std::get<Setting>(row.param);
+                             return name.str();
                          });
 
 } // namespace

@@ -3,7 +3,6 @@
 #include <unistd.h>
 
 #include <cstdio>
-
 #include <ostream>
 
 #include <gmock/gmock.h>

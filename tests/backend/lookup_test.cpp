@@ -164,7 +164,11 @@ TEST_F(BackendLookup, DoesNotCutANameAtANul) {
 TEST_F(BackendLookup, SurvivesANameThatIsTooLongForAFile) {
     const std::string name(4096, 'x');
 
-    expectFailedLoad(name, backendFile(SYSTEM_BACKEND_FOLDER, name));
+    EXPECT_FALSE(backend.load(name, "backup"));
+
+    const support::SyslogLine line = log.waitFor("load backend [" + name + "] action [backup] from [" +
+                                                 backendFile(SYSTEM_BACKEND_FOLDER, name) + "] failed");
+    EXPECT_EQ(LOG_DEBUG, line.priority);
 }
 
 TEST_F(BackendLookup, ReadsNoFolderAndNoFifoAsAFile) {

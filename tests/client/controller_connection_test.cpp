@@ -134,13 +134,12 @@ TEST(Connection, BelongsToOneController) {
 
 TEST(Connection, IsClosedAtTheControllersEnd) {
     FakeDaemon daemon({GOOD_REPLY});
-    const int before = support::openDescriptors(getpid());
     {
         JobController controller;
         EXPECT_EQ(200, controller.removeJob(1));
-        EXPECT_EQ(before + 2, support::openDescriptors(getpid())) << "the controller's end and the daemon's";
+        EXPECT_EQ(1, daemon.openConnections());
     }
-    EXPECT_TRUE(support::waitUntil([before]() { return support::openDescriptors(getpid()) == before; }));
+    EXPECT_TRUE(support::waitUntil([&daemon]() { return daemon.openConnections() == 0; }));
 }
 
 TEST(Connection, IsMadeAnewAfterAnEmptyReply) {

@@ -94,16 +94,14 @@ TEST(UnreadableReplies, TextThatIsNotJsonIsAnInternalError) {
     ErrorLog log;
     FakeDaemon daemon;
     JobController controller;
-    const std::string REPLIES[] = {
-        "pong",
-        "{\"code\":200",
-        "{\"code\":200}x",
-        "{\"code\":200}{\"code\":200}",
-        "{\"code\":0200}",
-        "{code:200}",
-        "100%s %n",
-        " ",
-    };
+    const std::string REPLIES[] = {"pong",
+                                   "{\"code\":200",
+                                   "{\"code\":200}x",
+                                   "{\"code\":200}{\"code\":200}",
+                                   "{\"code\":0200}",
+                                   "{code:200}",
+                                   "100%s %n",
+                                   " "};
     for (const Call& call : everyCall()) {
         for (const std::string& reply : REPLIES) {
             SCOPED_TRACE(call.name + (" " + reply));
@@ -152,33 +150,15 @@ TEST(UnreadableReplies, AReplyWithoutAnIntegerCodeIsAnInternalError) {
     ErrorLog log;
     FakeDaemon daemon;
     JobController controller;
-    const std::string REPLIES[] = {
-        // no object at all
-        "null",
-        "true",
-        "200",
-        "0.5",
-        "\"200\"",
-        "[]",
-        "[200]",
-        "[{\"code\":200}]",
-        // no code
-        "{}",
-        "{\"Code\":200}",
-        "{\"reply\":{\"code\":200}}",
-        "{\"job\":{},\"jobs\":[]}",
-        // a code of another type
-        "{\"code\":null}",
-        "{\"code\":true}",
-        "{\"code\":200.0}",
-        "{\"code\":2e2}",
-        "{\"code\":\"200\"}",
-        "{\"code\":[200]}",
-        "{\"code\":{\"code\":200}}",
-        "{\"code\":4294967496}",
-        "{\"code\":-2147483649}",
-        "{\"code\":\"200\",\"job\":{},\"jobs\":[]}",
-    };
+    const std::string REPLIES[] = {// no object at all
+                                   "null", "true", "200", "0.5", "\"200\"", "[]", "[200]", "[{\"code\":200}]",
+                                   // no code
+                                   "{}", "{\"Code\":200}", "{\"reply\":{\"code\":200}}", "{\"job\":{},\"jobs\":[]}",
+                                   // a code of another type
+                                   "{\"code\":null}", "{\"code\":true}", "{\"code\":200.0}", "{\"code\":2e2}",
+                                   "{\"code\":\"200\"}", "{\"code\":[200]}", "{\"code\":{\"code\":200}}",
+                                   "{\"code\":4294967496}", "{\"code\":-2147483649}",
+                                   "{\"code\":\"200\",\"job\":{},\"jobs\":[]}"};
     for (const Call& call : everyCall()) {
         for (const std::string& reply : REPLIES) {
             SCOPED_TRACE(call.name + (" " + reply));
@@ -221,15 +201,13 @@ TEST(UnreadableReplies, AListThatIsNoArrayIsAnInternalErrorAndNoEmptyList) {
     ErrorLog log;
     FakeDaemon daemon;
     JobController controller;
-    const std::string REPLIES[] = {
-        "{\"code\":200}",
-        "{\"code\":200,\"jobs\":null}",
-        "{\"code\":200,\"jobs\":{}}",
-        "{\"code\":200,\"jobs\":{\"0\":{}}}",
-        "{\"code\":200,\"jobs\":\"[]\"}",
-        "{\"code\":200,\"jobs\":1}",
-        "{\"code\":200,\"job\":[]}",
-    };
+    const std::string REPLIES[] = {"{\"code\":200}",
+                                   "{\"code\":200,\"jobs\":null}",
+                                   "{\"code\":200,\"jobs\":{}}",
+                                   "{\"code\":200,\"jobs\":{\"0\":{}}}",
+                                   "{\"code\":200,\"jobs\":\"[]\"}",
+                                   "{\"code\":200,\"jobs\":1}",
+                                   "{\"code\":200,\"job\":[]}"};
     for (const Call& call : everyCall()) {
         if (!call.fillsList && call.name != std::string("getJobByUnique")) {
             continue;

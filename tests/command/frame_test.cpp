@@ -1,5 +1,8 @@
 #include "command/frame.h"
 
+#include <cstddef>
+#include <cstdint>
+
 #include <gtest/gtest.h>
 
 using namespace MARU::Backup;

@@ -9,17 +9,30 @@
 #include "support/files.h"
 #include "support/waiting.h"
 
+namespace {
+
+/** The state's letter, which is 'R' also while a process is being woken. */
+char stateOf(pid_t pid) {
+    const std::string stat = support::readFile("/proc/" + std::to_string(pid) + "/stat");
+    return stat.at(stat.rfind(')') + 2);
+}
+
+} // namespace
+
 BlockedCall blockedCall(pid_t pid) {
-    std::istringstream fields(support::readFile("/proc/" + std::to_string(pid) + "/syscall"));
     BlockedCall call;
+    if (stateOf(pid) != 'S') {
+        return call;
+    }
+    std::istringstream fields(support::readFile("/proc/" + std::to_string(pid) + "/syscall"));
     std::string descriptor;
     std::string buffer;
     std::string size;
-    if (fields >> call.number >> descriptor >> buffer >> size) {
-        call.size = std::stoul(size, nullptr, 16);
-        return call;
+    if (!(fields >> call.number >> descriptor >> buffer >> size)) {
+        return BlockedCall();
     }
-    return BlockedCall();
+    call.size = std::stoul(size, nullptr, 16);
+    return call;
 }
 
 bool waitUntilBlockedIn(pid_t pid, const std::vector<long>& numbers) {

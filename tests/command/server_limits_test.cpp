@@ -5,7 +5,11 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <cerrno>
+#include <chrono>
 #include <csignal>
+#include <cstdint>
+#include <string>
 #include <vector>
 
 #include "server_process.h"

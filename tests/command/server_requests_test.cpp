@@ -1,12 +1,12 @@
-#include <sys/ioctl.h>
-#include <sys/socket.h>
 #include <syslog.h>
 
-#include <algorithm>
 #include <csignal>
+#include <memory>
 #include <random>
 #include <stdexcept>
+#include <string>
 #include <thread>
+#include <vector>
 
 #include "process_state.h"
 #include "refused_drain.h"
@@ -212,6 +212,30 @@ TEST_F(CommandServerRequests, AreHandledToTheirEndBeforeAnythingElse) {
     const std::vector<std::string> reports = server.reports();
     EXPECT_EQ("begin", reports.at(0));
     EXPECT_EQ("end", reports.at(1));
+}
+
+TEST_F(CommandServerRequests, WhoseClientIsGoneBeforeTheReplyHarmNothing) {
+    Hold hold;
+    ServerOptions options = withHandler(doing([&hold](CommandServer&) {
+        report("asked");
+        hold.wait();
+    }));
+    // As in the daemon, which takes the broken pipe's signal for itself.
+    options.setUp = [](CommandServer& running) { running.setSignalHandler(SIGPIPE, [](int) {}); };
+    ServerProcess server(path, options);
+    ASSERT_TRUE(waitUntilLoopSleeps(server.pid()));
+    const int before = support::openDescriptors(server.pid());
+
+    for (const std::size_t bytesBehindIt : {0U, 1U}) {
+        SocketPeer peer(path);
+        peer.write(frame("x") + std::string(bytesBehindIt, '\0'));
+        server.waitForReport("asked");
+        peer.close();
+        hold.release();
+
+        EXPECT_TRUE(support::waitUntil([&]() { return support::openDescriptors(server.pid()) == before; }));
+    }
+    EXPECT_EQ(RAN, server.stop());
 }
 
 TEST_F(CommandServerRequests, AreAnsweredAgainWhereTheirBytesCannotBeDropped) {

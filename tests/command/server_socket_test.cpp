@@ -5,10 +5,14 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdlib>
 #include <filesystem>
 #include <functional>
+#include <ostream>
+#include <string>
+#include <system_error>
 
 #include "process_state.h"
 #include "server_process.h"
@@ -268,11 +272,13 @@ TEST_F(CommandServerSocket, DoesNotReplaceAFolder) {
 }
 
 TEST_F(CommandServerSocket, ThatCannotBeBoundLeavesWhatOthersPutThereMeanwhile) {
+    std::unique_lock<std::mutex> held = log.hold();
     fillLog();
     ServerProcess server(path, failing([]() { refuseSystemCalls({SYS_bind}, EADDRINUSE); }));
     ASSERT_TRUE(waitUntilBlockedIn(server.pid(), {SYS_sendto})); // it has failed, and is about to say so
 
     support::writeFile(path, "of another daemon");
+    held.unlock();
     log.waitFor("bind [" + path + "] failed");
 
     EXPECT_EQ(DID_NOT_RUN, server.wait());

@@ -1,5 +1,6 @@
 #include <syslog.h>
 
+#include <chrono>
 #include <csignal>
 #include <string>
 #include <vector>
@@ -224,9 +225,7 @@ TEST_F(CommandServerLoopHandler, IsCalledEveryTwoSeconds) {
     // A late call does not delay the next one, so each is measured from the start.
     EXPECT_LE(started + 2000 - CLOCK_STEP, first);
     EXPECT_LE(started + 4000 - CLOCK_STEP, second);
-    const Reports reports = server.reports();
-    ASSERT_LE(4U, reports.size());
-    EXPECT_EQ("three seconds after the first call", reports[3]);
+    EXPECT_EQ(0U, server.reports().at(2).find("called")) << "three seconds without a call";
 }
 
 TEST_F(CommandServerLoopHandler, MayBeReplacedWhileTheLoopRuns) {

@@ -4,7 +4,9 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <csignal>
+#include <cstdint>
 #include <cstring>
 #include <filesystem>
 #include <functional>

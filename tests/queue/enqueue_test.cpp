@@ -1,6 +1,6 @@
 #include "queue/requests.h"
 
-#include <signal.h>
+#include <unistd.h>
 
 #include <ostream>
 
@@ -30,9 +30,9 @@ std::string heldRequest(Job::Action action, const std::string& name) {
                    name + R"("}})");
 }
 
-/** The reply to such a request that was admitted. */
-std::string heldReply(Job::Action action, const std::string& name, int id) {
-    return R"({"code":200,"job":{"action":)" + std::to_string(action) + R"(,"backend":"held","job_id":)" +
+/** The reply that admits a job whose unique string is its name. */
+std::string admission(const std::string& backend, int action, const std::string& name, int id) {
+    return R"({"code":200,"job":{"action":)" + std::to_string(action) + R"(,"backend":")" + backend + R"(","job_id":)" +
            std::to_string(id) + R"(,"param":{"name":")" + name + R"("},"status":1,"unique":")" + name + R"("}})";
 }
 
@@ -152,13 +152,13 @@ TEST_F(Enqueue, AdmitsEachActionIntoItsQueueAndStartsItsProcessAtOnce) {
         ++id;
         const std::string name = action2str(action);
 
-        EXPECT_EQ(heldReply(action, name, id), ask(heldRequest(action, name)));
+        EXPECT_EQ(admission("held", action, name, id), ask(heldRequest(action, name)));
 
         ASSERT_THAT(ids(name), ElementsAre(id));
         EXPECT_EQ(Job::STATUS_RUNNING, jobQueues[name].front().getStatus());
         EXPECT_TRUE(isRunning(jobQueues[name].front().getPid()));
     }
-    EXPECT_EQ(heldReply(Job::ACTION_RESTORE, "r", 7), ask(heldRequest(Job::ACTION_RESTORE, "r")));
+    EXPECT_EQ(admission("held", Job::ACTION_RESTORE, "r", 7), ask(heldRequest(Job::ACTION_RESTORE, "r")));
     EXPECT_THAT(statuses("restore"), ElementsAre(Job::STATUS_RUNNING));
 }
 
@@ -175,8 +175,8 @@ TEST_F(Enqueue, TellsTheDiaryAllAboutIt) {
 TEST_F(Enqueue, AppendsAJobThatHasToWait) {
     ask(heldRequest(Job::ACTION_BACKUP, "a"));
 
-    EXPECT_EQ(heldReply(Job::ACTION_BACKUP, "b", 2), ask(heldRequest(Job::ACTION_BACKUP, "b")));
-    EXPECT_EQ(heldReply(Job::ACTION_BACKUP, "c", 3), ask(heldRequest(Job::ACTION_BACKUP, "c")));
+    EXPECT_EQ(admission("held", Job::ACTION_BACKUP, "b", 2), ask(heldRequest(Job::ACTION_BACKUP, "b")));
+    EXPECT_EQ(admission("held", Job::ACTION_BACKUP, "c", 3), ask(heldRequest(Job::ACTION_BACKUP, "c")));
 
     EXPECT_THAT(ids("backup"), ElementsAre(1, 2, 3));
     EXPECT_THAT(statuses("backup"), ElementsAre(Job::STATUS_RUNNING, Job::STATUS_QUEUED, Job::STATUS_QUEUED));
@@ -186,9 +186,8 @@ TEST_F(Enqueue, AppendsAJobThatHasToWait) {
 TEST_F(Enqueue, AdmitsAJobOfAnUnknownActionIfTheBackendWantsIt) {
     writeLocalBackend("picky", "[none]\nunique = {{name}}\n");
 
-    EXPECT_EQ(
-        R"({"code":200,"job":{"action":3,"backend":"picky","job_id":1,"param":{"name":"n"},"status":1,"unique":"n"}})",
-        ask(request(R"({"backend":"picky","action":3,"status":0,"param":{"name":"n"}})")));
+    EXPECT_EQ(admission("picky", 3, "n", 1),
+              ask(request(R"({"backend":"picky","action":3,"status":0,"param":{"name":"n"}})")));
 
     EXPECT_THAT(statuses("none"), ElementsAre(Job::STATUS_QUEUED));
 }
@@ -197,9 +196,7 @@ TEST_F(Enqueue, AdmitsAJobThatThenCannotBeLaunchedAndDropsIt) {
     writeLocalBackend("picky", "[backup]\nunique = {{name}}\ncommand_check = /bin/rm " +
                                    support::backendFile(support::LOCAL_BACKEND_FOLDER, "picky") + "\n");
 
-    EXPECT_EQ(
-        R"({"code":200,"job":{"action":1,"backend":"picky","job_id":1,"param":{"name":"n"},"status":1,"unique":"n"}})",
-        ask(request(BACKUP)));
+    EXPECT_EQ(admission("picky", 1, "n", 1), ask(request(BACKUP)));
 
     EXPECT_THAT(ids("backup"), IsEmpty());
 }
@@ -209,7 +206,7 @@ TEST_F(Enqueue, TakesNothingFromAClientThatIsTheDaemonsToSay) {
     const std::string job = R"({"backend":"held","action":1,"status":3,"param":{"name":"n"},)"
                             R"("pid":1,"job_id":77,"unique":"mine"})";
 
-    EXPECT_EQ(heldReply(Job::ACTION_BACKUP, "n", 2), ask(request(job)));
+    EXPECT_EQ(admission("held", Job::ACTION_BACKUP, "n", 2), ask(request(job)));
 
     EXPECT_THAT(statuses("backup"), ElementsAre(Job::STATUS_RUNNING, Job::STATUS_QUEUED));
     EXPECT_EQ(-1, jobQueues["backup"].back().getPid());
@@ -236,13 +233,13 @@ TEST_F(Enqueue, KeepsABranch) {
 }
 
 TEST_F(Enqueue, LeavesAGapInTheIdsForASecondJobOfTheSameWork) {
-    EXPECT_EQ(heldReply(Job::ACTION_BACKUP, "a", 1), ask(heldRequest(Job::ACTION_BACKUP, "a")));
+    EXPECT_EQ(admission("held", Job::ACTION_BACKUP, "a", 1), ask(heldRequest(Job::ACTION_BACKUP, "a")));
     diary.take();
 
     EXPECT_EQ(R"({"code":409})", ask(heldRequest(Job::ACTION_BACKUP, "a")));
     EXPECT_THAT(diary.take(), ElementsAre("job unique conflict [a]"));
 
-    EXPECT_EQ(heldReply(Job::ACTION_BACKUP, "b", 3), ask(heldRequest(Job::ACTION_BACKUP, "b")));
+    EXPECT_EQ(admission("held", Job::ACTION_BACKUP, "b", 3), ask(heldRequest(Job::ACTION_BACKUP, "b")));
 }
 
 TEST_F(Enqueue, FindsTheSameWorkAlsoInAnotherQueueAndWhileItStops) {
@@ -286,9 +283,8 @@ TEST_F(Enqueue, LeavesTheWordToTheBackendsCheck) {
     EXPECT_EQ(R"({"code":400})", ask(request(BACKUP)));
     EXPECT_THAT(diary.take(), ElementsAre("invalid job"));
 
-    EXPECT_EQ(
-        R"({"code":200,"job":{"action":1,"backend":"picky","job_id":1,"param":{"name":"good"},"status":1,"unique":"good"}})",
-        ask(request(R"({"backend":"picky","action":1,"status":0,"param":{"name":"good"}})")));
+    EXPECT_EQ(admission("picky", 1, "good", 1),
+              ask(request(R"({"backend":"picky","action":1,"status":0,"param":{"name":"good"}})")));
 }
 
 TEST_F(Enqueue, RunsNoCheckForAnActionThatTheBackendDoesNotHave) {

@@ -1,6 +1,6 @@
 #include "queue/requests.h"
 
-#include <signal.h>
+#include <csignal>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

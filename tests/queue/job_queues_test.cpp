@@ -1,11 +1,9 @@
 #include "queue/job_queues.h"
 
 #include <climits>
-#include <functional>
-
-#include <boost/function.hpp>
 #include <ostream>
 
+#include <boost/function.hpp>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 

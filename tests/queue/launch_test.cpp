@@ -1,12 +1,11 @@
 #include "queue/queue_server.h"
 
-#include <signal.h>
 #include <sys/syscall.h>
 #include <syslog.h>
 #include <unistd.h>
 
 #include <cerrno>
-
+#include <csignal>
 #include <ostream>
 
 #include <gmock/gmock.h>

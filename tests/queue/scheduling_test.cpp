@@ -3,7 +3,8 @@
 #include <syslog.h>
 #include <unistd.h>
 
-#include <memory>
+#include <cstdio>
+#include <ostream>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -40,7 +41,7 @@ protected:
         for (const std::string& line : diary.take()) {
             int id = 0;
             int pid = 0;
-            if (sscanf(line.c_str(), "launch job [%d] on pid [%d]", &id, &pid) == 2) {
+            if (std::sscanf(line.c_str(), "launch job [%d] on pid [%d]", &id, &pid) == 2) {
                 launches.push_back(queueOf(id) + " " + std::to_string(id));
             }
         }
@@ -67,6 +68,10 @@ private:
 struct Limit {
     Job::Action action;
     int jobs;
+
+    friend std::ostream& operator<<(std::ostream& out, const Limit& row) {
+        return out << action2str(row.action) << " " << row.jobs;
+    }
 };
 
 class QueueLimit : public Scheduling, public testing::WithParamInterface<Limit> {

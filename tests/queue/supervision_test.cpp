@@ -5,7 +5,6 @@
 #include <unistd.h>
 
 #include <csignal>
-
 #include <ostream>
 
 #include <gmock/gmock.h>

@@ -69,6 +69,12 @@ int FakeDaemon::connections() {
     return accepted;
 }
 
+int FakeDaemon::openConnections() {
+    connections();
+    const std::lock_guard<std::mutex> lock(mutex);
+    return static_cast<int>(open.size());
+}
+
 void FakeDaemon::run() {
     while (true) {
         std::vector<pollfd> entries;

@@ -50,6 +50,8 @@ public:
     std::vector<std::string> requests();
     /** How many connections were made so far, those over which nothing came included. */
     int connections();
+    /** How many of them neither side has closed. */
+    int openConnections();
 
 private:
     struct Connection {

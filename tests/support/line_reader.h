@@ -1,24 +1,19 @@
 #pragma once
 
-#include <condition_variable>
 #include <functional>
 #include <mutex>
 #include <string>
-#include <thread>
 #include <vector>
+
+#include "support/descriptor_reader.h"
+#include "support/inbox.h"
 
 namespace support {
 
-/**
- * Collects the lines that come out of a pipe, as they come, so that whoever
- * writes them never waits for the test. Owns the descriptor.
- */
+/** Collects the lines that come out of a pipe, as they come. Owns the descriptor. */
 class LineReader {
 public:
     explicit LineReader(int fd);
-    ~LineReader();
-    LineReader(const LineReader&) = delete;
-    LineReader& operator=(const LineReader&) = delete;
 
     /**
      * Waits for a line that `matches` and that was not found by an earlier
@@ -26,21 +21,17 @@ public:
      * comes.
      */
     std::string waitFor(const std::string& what, const std::function<bool(const std::string&)>& matches);
-    /** All lines so far. */
+    /** All lines that were written before the call. */
     std::vector<std::string> all();
 
 private:
-    void run();
-    void take(const std::string& piece);
+    bool readAvailable();
 
     int fd;
-    int stop;
-    std::mutex mutex;
-    std::condition_variable arrived;
-    std::string rest;
-    std::vector<std::string> lines;
-    std::vector<bool> found;
-    std::thread thread;
+    std::mutex reading; ///< the reader takes lines as they come, and all() those that it has not taken yet
+    std::string rest;   ///< of a line that is not complete yet
+    Inbox<std::string> lines;
+    DescriptorReader reader; // the last, so that all else is there while it runs
 };
 
 } // namespace support

@@ -6,8 +6,9 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdio>
 #include <cstdlib>
-#include <regex>
+#include <cstring>
 #include <system_error>
 
 #include <gtest/gtest.h>
@@ -38,76 +39,84 @@ SyslogLine parseLine(const std::string& datagram) {
     return line;
 }
 
+int bindLogSocket() {
+    const int fd = socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
+    sockaddr_un address = {};
+    address.sun_family = AF_UNIX;
+    std::strcpy(address.sun_path, LOG_SOCKET);
+    if (fd < 0 || bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) < 0) {
+        throw std::system_error(errno, std::generic_category(), LOG_SOCKET);
+    }
+    return fd;
+}
+
 } // namespace
 
 LocatedMessage parseLocated(const std::string& message) {
-    static const std::regex form(R"(^\((\d+)\) \[(err|debug)\] ([^ :]+):(\d+) ([^]*)$)");
     LocatedMessage result;
-    std::smatch parts;
-    if (std::regex_match(message, parts, form)) {
+    char level[8] = {};
+    char unit[32] = {};
+    int textAt = -1;
+    const int read =
+        std::sscanf(message.c_str(), "(%d) [%7[a-z]] %31[^ :]:%d%n", &result.pid, level, unit, &result.line, &textAt);
+    const auto at = static_cast<std::size_t>(textAt);
+    if (read == 4 && textAt > 0 && at < message.size() && message[at] == ' ') {
         result.located = true;
-        result.pid = std::stoi(parts[1]);
-        result.level = parts[2];
-        result.unit = parts[3];
-        result.line = std::stoi(parts[4]);
-        result.text = parts[5];
+        result.level = level;
+        result.unit = unit;
+        result.text = message.substr(at + 1);
     }
     return result;
 }
 
-SyslogSocket::SyslogSocket() : fd(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
-    sockaddr_un address = {};
-    address.sun_family = AF_UNIX;
-    std::copy_n(LOG_SOCKET, sizeof "/dev/log", address.sun_path);
-    if (fd < 0 || bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) < 0) {
-        throw std::system_error(errno, std::generic_category(), LOG_SOCKET);
-    }
-    const int room = 4 << 20;
-    setsockopt(fd, SOL_SOCKET, SO_RCVBUFFORCE, &room, sizeof room);
+SyslogSocket::SyslogSocket()
+    : fd(bindLogSocket()), reader(fd, [this]() {
+          receive();
+          return true;
+      }) {
     closelog(); // this process may have found no socket before
 }
 
 SyslogSocket::~SyslogSocket() {
-    close(fd);
     unlink(LOG_SOCKET);
 }
 
 void SyslogSocket::receive() {
-    std::string datagram(1 << 20, '\0');
+    const std::lock_guard<std::mutex> lock(receiving);
+    static thread_local std::string datagram(1 << 18, '\0');
     while (true) {
         const ssize_t size = recv(fd, &datagram[0], datagram.size(), MSG_DONTWAIT);
         if (size < 0) {
             return;
         }
-        received.push_back(parseLine(datagram.substr(0, static_cast<std::size_t>(size))));
-        found.push_back(false);
+        received.put(parseLine(datagram.substr(0, static_cast<std::size_t>(size))));
     }
 }
 
-const std::vector<SyslogLine>& SyslogSocket::lines() {
+std::vector<SyslogLine> SyslogSocket::lines() {
     receive();
-    return received;
+    return received.all();
 }
 
 SyslogLine SyslogSocket::waitFor(const std::string& text) {
-    do {
-        receive();
-        for (std::size_t at = 0; at < received.size(); ++at) {
-            if (!found[at] && received[at].message.find(text) != std::string::npos) {
-                found[at] = true;
-                return received[at];
-            }
-        }
-    } while (waitReadable(fd));
-    ADD_FAILURE() << "never logged: " << text;
-    return SyslogLine();
+    const auto line =
+        received.waitFor([&text](const SyslogLine& one) { return one.message.find(text) != std::string::npos; });
+    if (!line) {
+        ADD_FAILURE() << "never logged: " << text;
+        return SyslogLine();
+    }
+    return *line;
 }
 
 int SyslogSocket::count(const std::string& text) {
-    receive();
-    return static_cast<int>(std::count_if(received.begin(), received.end(), [&text](const SyslogLine& line) {
+    const std::vector<SyslogLine> all = lines();
+    return static_cast<int>(std::count_if(all.begin(), all.end(), [&text](const SyslogLine& line) {
         return line.message.find(text) != std::string::npos;
     }));
+}
+
+std::unique_lock<std::mutex> SyslogSocket::hold() {
+    return std::unique_lock<std::mutex>(receiving);
 }
 
 void expectLocated(SyslogSocket& log, int priority, int pid, const std::string& unit, const std::string& text) {

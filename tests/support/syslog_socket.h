@@ -2,8 +2,12 @@
 
 #include <syslog.h>
 
+#include <mutex>
 #include <string>
 #include <vector>
+
+#include "support/descriptor_reader.h"
+#include "support/inbox.h"
 
 namespace support {
 
@@ -41,8 +45,8 @@ public:
     SyslogSocket(const SyslogSocket&) = delete;
     SyslogSocket& operator=(const SyslogSocket&) = delete;
 
-    /** All lines so far, without waiting. */
-    const std::vector<SyslogLine>& lines();
+    /** All lines that were logged before the call, without waiting. */
+    std::vector<SyslogLine> lines();
 
     /**
      * Waits for a line whose message holds `text`, and that was not found by an
@@ -50,15 +54,22 @@ public:
      */
     SyslogLine waitFor(const std::string& text);
 
-    /** How many of the lines so far hold `text`. */
+    /** How many of the lines that were logged before the call hold `text`. */
     int count(const std::string& text);
+
+    /**
+     * While the result is locked no line is taken out of the socket, and whoever
+     * logs has to wait once it is full.
+     */
+    std::unique_lock<std::mutex> hold();
 
 private:
     void receive();
 
     int fd;
-    std::vector<SyslogLine> received;
-    std::vector<bool> found;
+    std::mutex receiving; ///< the reader takes lines as they come, and lines() those that it has not taken yet
+    Inbox<SyslogLine> received;
+    DescriptorReader reader; // the last, so that all else is there while it runs
 };
 
 /**
