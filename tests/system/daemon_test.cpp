@@ -1,8 +1,10 @@
 #include "daemon_test.h"
 
 #include <algorithm>
+#include <filesystem>
 
 #include "support/backend_files.h"
+#include "support/socket_peer.h"
 
 using namespace MARU::Backup;
 
@@ -22,6 +24,10 @@ std::string exitLine(const Job& job, int status) {
 }
 
 DaemonTest::DaemonTest() {
+    // What the daemon of an earlier test in the same sandbox has left.
+    std::filesystem::remove(support::DAEMON_SOCKET);
+    std::filesystem::remove("/var/run/marubackupd.lock");
+    support::removeAllBackends();
     const std::string unique = "unique = {{gate}}\n";
     support::writeLocalBackend("gated", everyAction(WAITS_AT_GATE + unique));
     support::writeLocalBackend(

@@ -20,6 +20,7 @@ protected:
         options.awaitSocket = comesUp;
         options.beforeStart = [registration]() {
             setenv("LD_PRELOAD", REFUSED_REGISTRATION, 1);
+            setenv("ASAN_OPTIONS", "verify_asan_link_order=0", 0); // its library is loaded after ours
             setenv("REFUSED_REGISTRATION", registration.c_str(), 1);
         };
         start(options);

@@ -7,6 +7,7 @@
 #include <ostream>
 #include <string>
 #include <type_traits>
+#include <utility>
 
 #include <boost/function.hpp>
 #include <json/value.h>
@@ -50,8 +51,8 @@ static_assert(has<Json::Value (Job::*)() const, &Job::toJson> &&
 static_assert(has<std::string (Job::*)() const, &Job::toString>);
 static_assert(has<std::string (Job::*)(String) const, &Job::toFormatString>);
 static_assert(has<bool (*)(const Job&), &Job::isValidToEnqueue>);
-static_assert(has < std::ostream & (*)(std::ostream&, const Job&),
-              &operator< <> && has<std::string (*)(Job::Action), &action2str>);
+static_assert(std::is_same_v<std::ostream&, decltype(std::declval<std::ostream&>() << std::declval<const Job&>())>);
+static_assert(has<std::string (*)(Job::Action), &action2str>);
 
 static_assert(std::is_default_constructible_v<CommandClient> && !std::is_copy_constructible_v<CommandClient>);
 static_assert(has<bool (CommandClient::*)(String), &CommandClient::connect>);

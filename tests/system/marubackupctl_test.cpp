@@ -1,0 +1,263 @@
+// The operator's tool, as a shell sees it: what it prints, and its exit status.
+
+#include <fcntl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <csignal>
+
+#include <json/reader.h>
+#include <json/value.h>
+
+#include "daemon_test.h"
+#include "support/backend_files.h"
+#include "support/fake_daemon.h"
+#include "support/files.h"
+#include "support/in_child.h"
+#include "support/socket_peer.h"
+#include "support/waiting.h"
+
+using namespace MARU::Backup;
+using Arguments = std::vector<std::string>;
+
+namespace {
+
+/** What the tool printed and how it ended. */
+struct Outcome {
+    std::string ended;
+    std::string out;
+    std::string err;
+};
+
+class Marubackupctl : public DaemonTest {
+protected:
+    /** Starts the tool in the background. */
+    pid_t startTool(const Arguments& arguments) {
+        return support::startInChild([&]() {
+            redirect(STDOUT_FILENO, "out");
+            redirect(STDERR_FILENO, "err");
+            std::vector<char*> argv = {const_cast<char*>("marubackupctl")};
+            for (const std::string& argument : arguments) {
+                argv.push_back(const_cast<char*>(argument.c_str()));
+            }
+            argv.push_back(nullptr);
+            execv(MARUBACKUPCTL, argv.data());
+            return 126;
+        });
+    }
+
+    Outcome finish(pid_t tool) {
+        const std::string ended = support::describeStatus(support::waitForChild(tool));
+        return {ended, support::readFile(folder.path("out")), support::readFile(folder.path("err"))};
+    }
+
+    Outcome run(const Arguments& arguments) {
+        return finish(startTool(arguments));
+    }
+
+    /** Waits until the tool sleeps in the kernel, as it does when the daemon does not answer. */
+    static void awaitItsSleep(pid_t tool) {
+        const std::string process = "/proc/" + std::to_string(tool);
+        EXPECT_TRUE(support::waitUntil([&process]() {
+            return support::readFile(process + "/comm") == "marubackupctl\n" &&
+                   support::readFile(process + "/status").find("State:\tS") != std::string::npos;
+        }));
+    }
+
+    /** Adds, by the tool, a backup that waits at `gate`; the id that it printed. */
+    std::string addHeld(support::Gate& gate) {
+        const Outcome outcome = run({"add", "gated", "backup", "-p", "gate=" + gate.path()});
+        EXPECT_EQ("exit 0", outcome.ended) << outcome.err;
+        return outcome.out.substr(0, outcome.out.find('\n'));
+    }
+
+    static Json::Value parse(const std::string& text) {
+        Json::Value value;
+        const std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
+        EXPECT_TRUE(reader->parse(text.data(), text.data() + text.size(), &value, nullptr)) << text;
+        return value;
+    }
+
+private:
+    void redirect(int descriptor, const std::string& name) {
+        dup2(open(folder.path(name).c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600), descriptor);
+    }
+};
+
+} // namespace
+
+TEST_F(Marubackupctl, AddPrintsTheIdAloneAndHandsTheParametersOver) {
+    start();
+    support::Gate& gate = newGate();
+    const Outcome outcome = run({"add", "gated", "backup", "--branch", "launch", "-p", "gate=" + gate.path(), "-p",
+                                 "text=a=b:=c", "-p", "number:=5", "-p", "list:=[1,\"x\"]"});
+    EXPECT_EQ("exit 0", outcome.ended);
+    EXPECT_EQ("1\n", outcome.out);
+    EXPECT_EQ("", outcome.err);
+
+    Job job;
+    ASSERT_EQ(200, controller.getJob(1, job));
+    EXPECT_EQ("launch", job.getCommandBranch());
+    EXPECT_EQ("a=b:=c", job.getParam("text", Json::Value()).asString());
+    EXPECT_EQ(Json::Value(5), job.getParam("number", Json::Value()));
+    EXPECT_EQ(2U, job.getParam("list", Json::Value()).size());
+}
+
+TEST_F(Marubackupctl, ListShowsWhatRunsAndWhatWaits) {
+    start();
+    addHeld(newGate());
+    addHeld(newGate());
+    Job running;
+    ASSERT_EQ(200, controller.getJob(1, running));
+
+    const Outcome table = run({"list"});
+    EXPECT_EQ("exit 0", table.ended);
+    EXPECT_EQ(0U, table.out.rfind("ID ACTION STATUS  PID", 0)) << table.out;
+    EXPECT_NE(std::string::npos, table.out.find("\n1  backup running " + std::to_string(running.getPid())))
+        << table.out;
+    EXPECT_NE(std::string::npos, table.out.find("\n2  backup queued  -")) << table.out;
+
+    const Json::Value jobs = parse(run({"--json", "list"}).out);
+    ASSERT_EQ(2U, jobs.size());
+    EXPECT_EQ(running.toJson(), jobs[0]);
+}
+
+TEST_F(Marubackupctl, ListTakesOnlyWhatItsFiltersTake) {
+    start();
+    addHeld(newGate());
+    EXPECT_EQ(1U, parse(run({"list", "--json", "--action", "backup"}).out).size());
+    EXPECT_EQ(0U, parse(run({"list", "--json", "--action", "relink"}).out).size());
+    EXPECT_EQ(0U, parse(run({"list", "--json", "--backend", "other"}).out).size());
+    EXPECT_EQ(1U, parse(run({"list", "--json", "--format", "{{BACKEND}}", "--target", "gated"}).out).size());
+    EXPECT_EQ(1U, parse(run({"list", "--json", "--unique", gates[0]->path()}).out).size());
+}
+
+TEST_F(Marubackupctl, ListLetsNoControlCharacterOfAJobReachTheTerminal) {
+    start();
+    Job job("gated", Job::ACTION_BACKUP);
+    job.setParam("gate", "\x1b[2J");
+    addGated(Job::ACTION_BACKUP, newGate());
+    add(job);
+    const Outcome outcome = run({"list"});
+    EXPECT_NE(std::string::npos, outcome.out.find("[2J")) << outcome.out;
+    EXPECT_EQ(std::string::npos, outcome.out.find('\x1b')) << outcome.out;
+}
+
+TEST_F(Marubackupctl, ShowTellsAJobWithItsParameters) {
+    start();
+    addHeld(newGate());
+    const Outcome text = run({"show", "1"});
+    EXPECT_EQ("exit 0", text.ended);
+    EXPECT_NE(std::string::npos, text.out.find("status: running\n")) << text.out;
+    EXPECT_NE(std::string::npos, text.out.find("param.gate: " + gates[0]->path() + "\n")) << text.out;
+    EXPECT_EQ("gated", parse(run({"show", "1", "--json"}).out)["backend"].asString());
+}
+
+TEST_F(Marubackupctl, RemoveTakesJobsOutAndReportsTheWorstOutcome) {
+    start();
+    addHeld(newGate());
+    addHeld(newGate());
+    EXPECT_EQ("exit 0", run({"remove", "2"}).ended);
+    EXPECT_EQ("exit 3", run({"remove", "1", "77"}).ended);
+    EXPECT_EQ("exit 3", run({"show", "2"}).ended);
+    daemon->waitForLine("job [1] core dump");
+}
+
+TEST_F(Marubackupctl, WaitReturnsWhenTheJobsHaveEnded) {
+    start();
+    support::Gate& gate = newGate();
+    const std::string id = addHeld(gate);
+    EXPECT_EQ("exit 124", run({"wait", "--for", "0.1", id}).ended);
+
+    const pid_t tool = startTool({"wait", id, "99"});
+    gate.open();
+    EXPECT_EQ("exit 0", finish(tool).ended);
+}
+
+TEST_F(Marubackupctl, BackendsListsTheInstalledOnesByName) {
+    start();
+    support::writeSystemBackend("zebra", "[restore]\ncommand_launch = true\ndelegate =\n");
+    support::writeSystemBackend("ape", "[backup]\n[copy_to]\n");
+    const Outcome table = run({"backends"});
+    EXPECT_EQ("exit 0", table.ended);
+    const std::size_t ape = table.out.find("\nape ");
+    const std::size_t zebra = table.out.find("\nzebra ");
+    EXPECT_TRUE(ape < zebra && zebra != std::string::npos) << table.out;
+    EXPECT_NE(std::string::npos, table.out.find("backup,copy_to")) << table.out;
+    EXPECT_EQ(2U, parse(run({"backends", "--json"}).out).size());
+}
+
+TEST_F(Marubackupctl, ARefusalIsStatusFourInWordsAndInJson) {
+    start();
+    addHeld(newGate());
+    const Arguments same = {"add", "gated", "backup", "-p", "gate=" + gates[0]->path()};
+    const Outcome words = run(same);
+    EXPECT_EQ("exit 4", words.ended);
+    EXPECT_EQ("", words.out);
+    EXPECT_NE(std::string::npos, words.err.find("the same work is waiting or running")) << words.err;
+
+    Arguments inJson = same;
+    inJson.push_back("--json");
+    const Outcome json = run(inJson);
+    EXPECT_EQ("exit 4", json.ended);
+    EXPECT_EQ(409, parse(json.out)["code"].asInt());
+    EXPECT_EQ("exit 4", run({"add", "unheard-of", "backup"}).ended);
+}
+
+TEST_F(Marubackupctl, WrongUsageIsStatusTwo) {
+    for (const Arguments& wrong : std::vector<Arguments>{{},
+                                                         {"dance"},
+                                                         {"add", "gated"},
+                                                         {"add", "gated", "sing"},
+                                                         {"add", "gated", "backup", "-p", "no-value"},
+                                                         {"add", "gated", "backup", "-p", "x:={"},
+                                                         {"show", "0"},
+                                                         {"show", "x"},
+                                                         {"list", "--format", "x"},
+                                                         {"list", "--timeout", "0"}}) {
+        const Outcome outcome = run(wrong);
+        EXPECT_EQ("exit 2", outcome.ended) << outcome.err;
+        EXPECT_EQ("", outcome.out);
+        EXPECT_NE("", outcome.err);
+    }
+}
+
+TEST_F(Marubackupctl, NoDaemonIsStatusFive) {
+    const Outcome outcome = run({"list"});
+    EXPECT_EQ("exit 5", outcome.ended);
+    EXPECT_NE(std::string::npos, outcome.err.find("start marubackupd")) << outcome.err;
+}
+
+TEST_F(Marubackupctl, AStoppedDaemonIsStatus124) {
+    start();
+    daemon->signal(SIGSTOP);
+    const Outcome outcome = run({"list", "--timeout", "0.2"});
+    EXPECT_EQ("exit 124", outcome.ended);
+    EXPECT_NE(std::string::npos, outcome.err.find("no answer from marubackupd within 0.2 seconds")) << outcome.err;
+    daemon->signal(SIGCONT);
+}
+
+TEST_F(Marubackupctl, ADaemonThatGoesAwayBeforeItsAnswerIsStatusFive) {
+    start();
+    daemon->signal(SIGSTOP);
+    const pid_t tool = startTool({"list"});
+    awaitItsSleep(tool);
+    daemon->stop(SIGKILL);
+    EXPECT_EQ("exit 5", finish(tool).ended);
+}
+
+TEST_F(Marubackupctl, AnAnswerThatCannotBeReadIsStatusOne) {
+    const support::FakeDaemon nonsense({"nonsense"});
+    EXPECT_EQ("exit 1", run({"list"}).ended);
+}
+
+TEST_F(Marubackupctl, AnInterruptedOneIsStatus130) {
+    start();
+    daemon->signal(SIGSTOP);
+    const pid_t tool = startTool({"list"});
+    awaitItsSleep(tool);
+    kill(tool, SIGINT);
+    EXPECT_EQ("exit 130", finish(tool).ended);
+    daemon->signal(SIGCONT);
+}
