@@ -10,20 +10,27 @@
 #include "support/in_child.h"
 #include "support/socket_peer.h"
 
+using namespace MARU::Backup;
+
 namespace {
 
 class StartUp : public DaemonTest {
 protected:
-    /** Starts a daemon whose server refuses one kind of registration. */
-    void startRefusing(const std::string& registration, bool comesUp) {
+    /** Starts a daemon with `standIn` before the library, which reads `wish`. */
+    void startWith(const std::string& standIn, const std::string& wish, bool comesUp) {
         support::DaemonOptions options;
         options.awaitSocket = comesUp;
-        options.beforeStart = [registration]() {
-            setenv("LD_PRELOAD", REFUSED_REGISTRATION, 1);
+        options.beforeStart = [standIn, wish]() {
+            setenv("LD_PRELOAD", standIn.c_str(), 1);
             setenv("ASAN_OPTIONS", "verify_asan_link_order=0", 0); // its library is loaded after ours
-            setenv("REFUSED_REGISTRATION", registration.c_str(), 1);
+            setenv("REFUSED_REGISTRATION", wish.c_str(), 1);
         };
         start(options);
+    }
+
+    /** Starts a daemon whose server refuses one kind of registration. */
+    void startRefusing(const std::string& registration, bool comesUp) {
+        startWith(REFUSED_REGISTRATION, registration, comesUp);
     }
 };
 
@@ -47,6 +54,14 @@ TEST_F(StartUp, WithoutAFolderWatchTheDaemonServes) {
     startRefusing("watch", true);
     support::expectLocated(log, LOG_ERR, daemon->pid(), "queue_server", "config folder add watch failed");
     EXPECT_EQ("{\"code\":200,\"jobs\":[]}", support::SocketPeer().ask("{\"op\":\"job_list\"}"));
+}
+
+TEST_F(StartUp, WhileARestoreRunsElsewhereNoJobIsAdmitted) {
+    startWith(RESTORE_ELSEWHERE, "", true);
+    Job job("gated", Job::ACTION_BACKUP);
+    EXPECT_EQ(406, controller.addJob(job));
+    daemon->waitForLine("restore job running");
+    EXPECT_EQ(404, controller.getJob(1, job));
 }
 
 TEST_F(StartUp, TheSocketIsForRootAndTheAdministratorsGroup) {
