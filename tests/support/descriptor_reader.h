@@ -1,6 +1,7 @@
 #pragma once
 
 #include <functional>
+#include <future>
 #include <thread>
 
 namespace support {
@@ -26,6 +27,7 @@ private:
     int fd;
     int stop;
     std::function<bool()> read;
+    std::promise<void> running;
     std::thread thread;
 };
 

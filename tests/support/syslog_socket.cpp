@@ -71,7 +71,10 @@ LocatedMessage parseLocated(const std::string& message) {
 
 SyslogSocket::SyslogSocket()
     : fd(bindLogSocket()), reader(fd, [this]() {
-          receive();
+          const std::unique_lock<std::mutex> lock(receiving, std::try_to_lock);
+          if (lock) { // not on hold
+              receive();
+          }
           return true;
       }) {
     closelog(); // this process may have found no socket before
@@ -82,7 +85,6 @@ SyslogSocket::~SyslogSocket() {
 }
 
 void SyslogSocket::receive() {
-    const std::lock_guard<std::mutex> lock(receiving);
     static thread_local std::string datagram(1 << 18, '\0');
     while (true) {
         const ssize_t size = recv(fd, &datagram[0], datagram.size(), MSG_DONTWAIT);
@@ -94,6 +96,7 @@ void SyslogSocket::receive() {
 }
 
 std::vector<SyslogLine> SyslogSocket::lines() {
+    const std::lock_guard<std::mutex> lock(receiving);
     receive();
     return received.all();
 }
