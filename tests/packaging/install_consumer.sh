@@ -27,7 +27,7 @@ export PKG_CONFIG_PATH
     $(pkg-config --cflags marubackup-si) -o "$work/by-pkg-config" $(pkg-config --libs marubackup-si)
 check "$work/by-pkg-config"
 
-"$cmake" -S "$source" -B "$work/by-cmake" -DCMAKE_PREFIX_PATH="$work/tree" -DCMAKE_CXX_COMPILER="$compiler" \
+"$cmake" -G Ninja -S "$source" -B "$work/by-cmake" -DCMAKE_PREFIX_PATH="$work/tree" -DCMAKE_CXX_COMPILER="$compiler" \
     -DCMAKE_CXX_STANDARD=17 >"$work/cmake.log" || { cat "$work/cmake.log"; exit 1; }
 "$cmake" --build "$work/by-cmake" >"$work/cmake.log" || { cat "$work/cmake.log"; exit 1; }
 check "$work/by-cmake/consumer"
