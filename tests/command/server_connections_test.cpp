@@ -1,5 +1,8 @@
+#include <fcntl.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <syslog.h>
+#include <unistd.h>
 
 #include <chrono>
 #include <csignal>
@@ -287,4 +290,28 @@ TEST_F(CommandServerLoop, LeavesTheConnectionsOpenThatItHadWhenItEnded) {
     hold.release();
     EXPECT_EQ(RAN, server.wait());
     EXPECT_TRUE(peer.isClosed());
+}
+
+TEST_F(CommandServerLoop, HasNoSocketThatCouldBlockIt) {
+    int firstOwn = 0;
+    ServerOptions options;
+    options.setUp = [&firstOwn](CommandServer&) {
+        firstOwn = dup(STDIN_FILENO);
+        close(firstOwn);
+    };
+    options.handler = doing([&firstOwn](CommandServer&) {
+        for (int fd = firstOwn; fd < firstOwn + 100; ++fd) {
+            struct stat record = {};
+            if (fstat(fd, &record) == 0 && S_ISSOCK(record.st_mode)) {
+                report((fcntl(fd, F_GETFL) & O_NONBLOCK) != 0 ? "not blocking" : "blocking");
+            }
+        }
+    });
+    ServerProcess server(path, options);
+
+    server.ask("x");
+
+    EXPECT_EQ(RAN, server.stop());
+    EXPECT_EQ(0, server.countReports("blocking"));
+    EXPECT_LE(2, server.countReports("not blocking")); // the one that listens, and the connection
 }
