@@ -5,7 +5,9 @@
 #include <unistd.h>
 
 #include <csignal>
+#include <future>
 #include <mutex>
+#include <set>
 #include <utility>
 
 namespace support {
@@ -19,6 +21,9 @@ namespace {
  */
 std::mutex working;
 
+/** Those that there are now; the tests' main thread makes and destroys them. */
+std::set<DescriptorReader*> readers;
+
 void pauseForForks() {
     static const int registered =
         pthread_atfork([]() { working.lock(); }, []() { working.unlock(); }, []() { working.unlock(); });
@@ -30,24 +35,52 @@ void pauseForForks() {
 DescriptorReader::DescriptorReader(int descriptor, std::function<bool()> readSome)
     : fd(descriptor), stop(eventfd(0, EFD_CLOEXEC)), read(std::move(readSome)) {
     pauseForForks();
-    sigset_t all;
-    sigset_t old;
-    sigfillset(&all);
-    pthread_sigmask(SIG_SETMASK, &all, &old);
-    thread = std::thread(&DescriptorReader::run, this);
-    pthread_sigmask(SIG_SETMASK, &old, nullptr);
-    running.get_future().wait();
+    start();
+    readers.insert(this);
 }
 
 DescriptorReader::~DescriptorReader() {
-    eventfd_write(stop, 1);
-    thread.join();
+    readers.erase(this);
+    end();
     close(stop);
     close(fd);
 }
 
+void DescriptorReader::pauseAll() {
+    for (DescriptorReader* const reader : readers) {
+        reader->end();
+    }
+}
+
+void DescriptorReader::resumeAll() {
+    for (DescriptorReader* const reader : readers) {
+        reader->start();
+    }
+}
+
+void DescriptorReader::start() {
+    sigset_t all;
+    sigset_t old;
+    sigfillset(&all);
+    pthread_sigmask(SIG_SETMASK, &all, &old);
+    std::promise<void> running;
+    const std::future<void> started = running.get_future();
+    thread = std::thread([this, running = std::move(running)]() mutable {
+        running.set_value();
+        run();
+    });
+    pthread_sigmask(SIG_SETMASK, &old, nullptr);
+    started.wait();
+}
+
+void DescriptorReader::end() {
+    eventfd_write(stop, 1);
+    thread.join();
+    eventfd_t calls = 0;
+    eventfd_read(stop, &calls);
+}
+
 void DescriptorReader::run() {
-    running.set_value();
     while (true) {
         pollfd entries[] = {{fd, POLLIN, 0}, {stop, POLLIN, 0}};
         if (poll(entries, 2, -1) < 0) {

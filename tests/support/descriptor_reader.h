@@ -1,7 +1,6 @@
 #pragma once
 
 #include <functional>
-#include <future>
 #include <thread>
 
 namespace support {
@@ -21,13 +20,22 @@ public:
     DescriptorReader(const DescriptorReader&) = delete;
     DescriptorReader& operator=(const DescriptorReader&) = delete;
 
+    // Between these two calls no reader of the process has a thread, so that
+    // what is forked there comes from a process of a single one: in any other
+    // the thread sanitizer no longer delivers signals. What arrives meanwhile
+    // is read afterwards.
+
+    static void pauseAll();
+    static void resumeAll();
+
 private:
+    void start();
+    void end();
     void run();
 
     int fd;
     int stop;
     std::function<bool()> read;
-    std::promise<void> running;
     std::thread thread;
 };
 

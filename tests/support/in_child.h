@@ -11,6 +11,8 @@
 #include <string>
 #include <system_error>
 
+#include "support/descriptor_reader.h"
+
 namespace support {
 
 /** What runInChild() ends its child with after an exception. */
@@ -25,9 +27,14 @@ const int CHILD_THREW = 125;
 template <typename Body>
 pid_t startInChild(Body body) {
     std::fflush(nullptr);
+    DescriptorReader::pauseAll();
     const pid_t child = fork();
+    const int error = errno;
+    if (child != 0) {
+        DescriptorReader::resumeAll();
+    }
     if (child < 0) {
-        throw std::system_error(errno, std::generic_category(), "fork");
+        throw std::system_error(error, std::generic_category(), "fork");
     }
     if (child == 0) {
         int status = CHILD_THREW;
