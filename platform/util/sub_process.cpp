@@ -38,26 +38,46 @@ const int OUTPUT_FLAGS = O_WRONLY | O_CREAT | O_APPEND | O_NOCTTY;
 const mode_t OUTPUT_MODE = 0640;
 const int FIRST_OTHER_DESCRIPTOR = STDERR_FILENO + 1;
 
+const std::size_t MAX_SHOWN = 200;
+
+/** The start of `text` on one line: what a client has put into a name cannot look like a line of its own. */
+std::string shown(const std::string& text) {
+    std::string line = text.substr(0, MAX_SHOWN);
+    std::replace_if(
+        line.begin(), line.end(), [](char c) { return static_cast<unsigned char>(c) < ' ' || c == '\x7f'; }, '?');
+    return line.size() < text.size() ? line + "..." : line;
+}
+
+/** Writes why a program does not run to `descriptor`, if that is open; leaves errno alone. */
+void report(int descriptor, const SubProcessPrivate& d, const std::string& reason) {
+    const int error = errno;
+    const std::string name = d.argv.empty() ? std::string() : d.argv.front();
+    const std::string line = "cannot run [" + shown(name) + "]: " + reason + "\n";
+    [[maybe_unused]] const ssize_t result = write(descriptor, line.data(), line.size());
+    errno = error;
+}
+
 bool hasNul(const std::string& text) {
     return text.find('\0') != std::string::npos;
 }
 
-/** Whether all texts can be handed to the kernel as they are. */
-bool isWellFormed(const SubProcessPrivate& d) {
+/** What cannot be handed to the kernel as it is; null if all can. */
+const char* malformedPart(const SubProcessPrivate& d) {
     if (d.argv.empty() || d.argv.front().empty()) {
-        return false;
+        return "no program is named";
     }
-    for (const std::string& argument : d.argv) {
-        if (hasNul(argument)) {
-            return false;
-        }
+    if (std::any_of(d.argv.begin(), d.argv.end(), hasNul)) {
+        return "an argument contains a NUL byte";
     }
     for (const auto& [name, value] : d.additions) {
         if (name.empty() || name.find('=') != std::string::npos || hasNul(name) || hasNul(value)) {
-            return false;
+            return "a variable's name is empty or contains \"=\", or one contains a NUL byte";
         }
     }
-    return !(d.stdOutput && hasNul(*d.stdOutput)) && !(d.stdError && hasNul(*d.stdError));
+    if ((d.stdOutput && hasNul(*d.stdOutput)) || (d.stdError && hasNul(*d.stdError))) {
+        return "an output file's name contains a NUL byte";
+    }
+    return nullptr;
 }
 
 /** Whether `path` is a program that we may run; if not, errno says why. */
@@ -127,16 +147,20 @@ std::vector<char*> pointersTo(const Texts& texts) {
 class Program {
 public:
     explicit Program(const SubProcessPrivate& d) : argv(pointersTo(d.argv)) {
-        if (!isWellFormed(d)) {
+        if (const char* const part = malformedPart(d)) {
             errno = EINVAL;
+            report(STDERR_FILENO, d, part);
             return;
         }
         variables = mergedEnvironment(d.additions);
         envp = pointersTo(variables);
         path = findProgram(d.argv.front());
+        if (path.empty()) {
+            report(STDERR_FILENO, d, std::strerror(errno));
+        }
     }
 
-    /** False, with errno set just after the construction, if there is none to run. */
+    /** False, reported, and with errno set just after the construction, if there is none to run. */
     bool isFound() const {
         return !path.empty();
     }
@@ -237,15 +261,17 @@ bool openOutput(int descriptor, const std::string& path) {
     return done;
 }
 
-bool redirectOutput(const SubProcessPrivate& d) {
+/** Puts the output files in place; the one that cannot be opened, with errno set, or null. */
+const std::string* redirectOutput(const SubProcessPrivate& d) {
     if (d.stdOutput && !openOutput(STDOUT_FILENO, *d.stdOutput)) {
-        return false;
+        return &*d.stdOutput;
     }
     if (!d.stdError) {
-        return true;
+        return nullptr;
     }
-    return d.stdError == d.stdOutput ? dup2(STDOUT_FILENO, STDERR_FILENO) == STDERR_FILENO
-                                     : openOutput(STDERR_FILENO, *d.stdError);
+    const bool done = d.stdError == d.stdOutput ? dup2(STDOUT_FILENO, STDERR_FILENO) == STDERR_FILENO
+                                                : openOutput(STDERR_FILENO, *d.stdError);
+    return done ? nullptr : &*d.stdError;
 }
 
 /** Keeps every descriptor but 0, 1 and 2 from the next program; false, with errno set, if that fails. */
@@ -304,6 +330,7 @@ int SubProcess::call() const {
     const int error = spawn(*d, program, child);
     if (error != 0) {
         errno = error;
+        report(STDERR_FILENO, *d, std::strerror(error));
         return -1;
     }
     int status = 0;
@@ -320,13 +347,20 @@ int SubProcess::exec() const {
     if (!program.isFound()) {
         return -1;
     }
+    // Where the caller reports, also when the program's errors have a file of their own.
+    const int reports = fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, FIRST_OTHER_DESCRIPTOR);
     resetSignalDispositions();
     setpgid(0, 0);
-    if (redirectOutput(*d) && markCloseOnExec()) {
+    const std::string* const unopened = redirectOutput(*d);
+    if (!unopened && markCloseOnExec()) {
         // Last, so that a signal held back until now finds the defaults in place.
         emptySignalMask();
         execve(program.path.c_str(), program.argv.data(), program.envp.data());
     }
+    const int error = errno;
+    report(reports, *d, (unopened ? "its output file [" + shown(*unopened) + "]: " : "") + std::strerror(error));
+    close(reports);
+    errno = error;
     return -1;
 }
 

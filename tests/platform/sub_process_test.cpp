@@ -247,6 +247,45 @@ TEST_P(ARunProgram, IsRefusedIfATextCannotReachTheKernelWhole) {
     EXPECT_FALSE(exists(out)) << "a refused program's output file was made";
 }
 
+TEST_P(ARunProgram, IsReportedOnOneLineIfItDoesNotRun) {
+    const auto reportOf = [this](SubProcess& process) {
+        const std::string report = dir.path("report");
+        writeFile(report, "");
+        outcome(process, [&] { dup2(open(report.c_str(), O_WRONLY), STDERR_FILENO); });
+        return readFile(report);
+    };
+    const std::string longName(300, 'x');
+    const std::vector<std::pair<std::list<std::string>, std::string>> rows = {
+        {{}, "cannot run []: no program is named\n"},
+        {{"missing"}, "cannot run [missing]: No such file or directory\n"},
+        {{"/etc/passwd"}, "cannot run [/etc/passwd]: Permission denied\n"},
+        {{"true", std::string("\0", 1)}, "cannot run [true]: an argument contains a NUL byte\n"},
+        {{"true", std::string(1 << 20, 'x')}, "cannot run [true]: Argument list too long\n"},
+        {{"no\nsuch\x1b[1m\x7f"}, "cannot run [no?such?[1m?]: No such file or directory\n"},
+        {{longName}, "cannot run [" + longName.substr(0, 200) + "...]: No such file or directory\n"},
+    };
+    for (const auto& [argv, expected] : rows) {
+        SubProcess process(argv);
+        // Its own errors go to another file; why it is not there to write any does not.
+        process.setStdError(err, 0);
+        EXPECT_EQ(expected, reportOf(process));
+    }
+    SubProcess named({"true"});
+    named.setEnv("", "value");
+    EXPECT_EQ("cannot run [true]: a variable's name is empty or contains \"=\", or one contains a NUL byte\n",
+              reportOf(named));
+    SubProcess split({"true"});
+    split.setStdOutput(std::string("\0", 1), 0);
+    EXPECT_EQ("cannot run [true]: an output file's name contains a NUL byte\n", reportOf(split));
+}
+
+TEST_P(ARunProgram, IsNotReportedIfItRuns) {
+    const std::string report = dir.path("report");
+    SubProcess process(shell("exit 3"));
+    EXPECT_EQ("exit 3", outcome(process, [&] { dup2(open(report.c_str(), O_WRONLY | O_CREAT, 0600), STDERR_FILENO); }));
+    EXPECT_EQ("", readFile(report));
+}
+
 // Where it is looked for.
 
 TEST_P(ARunProgram, IsTheFirstOfItsNameInPath) {
@@ -591,6 +630,18 @@ TEST(ACaller, LeavesNoChildAndNoDescriptorBehind) {
 }
 
 // What exec() alone promises.
+
+TEST(AReplacedProcess, IsToldWhichOutputFileCannotBeOpened) {
+    const TempDir dir;
+    const std::string report = dir.path("report");
+    SubProcess process({"true"});
+    process.setStdOutput("/nowhere/out", 0);
+    runInChild([&] {
+        dup2(open(report.c_str(), O_WRONLY | O_CREAT, 0600), STDERR_FILENO);
+        return process.exec() == -1 && errno == ENOENT ? 0 : 1;
+    });
+    EXPECT_EQ("cannot run [true]: its output file [/nowhere/out]: No such file or directory\n", readFile(report));
+}
 
 TEST(AReplacedProcess, KeepsItsId) {
     const TempDir dir;

@@ -22,7 +22,9 @@ class SubProcessPrivate;
  *
  * Nothing can be run if the list or the program's name is empty, if a variable
  * has no name or one with a "=", or if an argument, a variable or a file name
- * contains a NUL. Nothing throws but a failed allocation.
+ * contains a NUL. Why a program could not be run is written to the caller's
+ * standard error, as "cannot run [program]: reason" on one line. Nothing throws
+ * but a failed allocation.
  */
 class MARUBACKUP_UTIL_API SubProcess {
 public:
