@@ -3,6 +3,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <cstdio>
 #include <exception>
 #include <iostream>
 #include <string>
@@ -33,6 +34,7 @@ int serve(bool debug) {
     if (!lock.acquire()) {
         return COULD_NOT_SERVE;
     }
+    unblockSignals();
     raiseDescriptorLimit();
     warnOfSocketGroup();
     try {
@@ -50,6 +52,8 @@ int serve(bool debug) {
 
 int main(int argc, char** argv) {
     openMissingStandardDescriptors();
+    // The lines of the diary stay whole, also beside those of jobs that share it.
+    std::setvbuf(stderr, nullptr, _IOLBF, BUFSIZ);
     openlog("marubackupd", LOG_PID, LOG_DAEMON);
 
     bool debug = false;

@@ -3,9 +3,11 @@
 
 #include <fcntl.h>
 #include <linux/capability.h>
+#include <sched.h>
 #include <sys/mount.h>
 #include <sys/prctl.h>
 #include <sys/resource.h>
+#include <sys/socket.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -89,6 +91,48 @@ TEST_F(Marubackupd, FollowsNoLinkToAnotherFile) {
 TEST_F(Marubackupd, RefusesToRunWithoutRoot) {
     EXPECT_EQ("exit 1", endOf({}, becomeNobodyWhoReadsEverything));
     EXPECT_NE(std::string::npos, diary.at(0).find("must be started by root"));
+}
+
+TEST_F(Marubackupd, RefusesToRunWithoutTheFolderOfItsSocket) {
+    const auto hideVar = []() {
+        if (unshare(CLONE_NEWNS) != 0 || mount("tmpfs", "/var", "tmpfs", 0, nullptr) != 0) {
+            _exit(99);
+        }
+    };
+    EXPECT_EQ("exit 1", endOf({}, hideVar));
+    EXPECT_EQ("marubackupd: cannot open the lock file /var/run/marubackupd.lock: No such file or directory",
+              diary.at(0));
+}
+
+TEST_F(Marubackupd, ServesWithoutSyslog) {
+    std::filesystem::remove("/dev/log");
+    start();
+    support::writeLocalBackend("quick", everyAction("command_launch = true\n"));
+    daemon->waitForLine(exitLine(add(Job("quick", Job::ACTION_BACKUP)), 0));
+    Job unknown("unknown", Job::ACTION_BACKUP);
+    EXPECT_EQ(505, controller.addJob(unknown));
+    EXPECT_EQ("exit 0", support::describeStatus(daemon->stop(SIGTERM)));
+}
+
+TEST_F(Marubackupd, WritesEachLineOfItsDiaryAtOnce) {
+    // Otherwise what a job writes to the same place would end up in the middle of it.
+    int diaryEnds[2];
+    ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0, diaryEnds));
+    support::DaemonOptions options;
+    options.beforeStart = [&diaryEnds]() { dup2(diaryEnds[1], STDERR_FILENO); };
+    start(options);
+    close(diaryEnds[1]);
+    const Job job = addGated(Job::ACTION_BACKUP, newGate());
+    daemon->stop(SIGTERM);
+
+    int lines = 0;
+    char piece[65536];
+    for (ssize_t size = 0; (size = recv(diaryEnds[0], piece, sizeof piece, 0)) > 0; ++lines) {
+        const std::string line(piece, static_cast<std::size_t>(size));
+        EXPECT_EQ(line.size() - 1, line.find('\n')) << line;
+    }
+    EXPECT_LT(4, lines);
+    close(diaryEnds[0]);
 }
 
 TEST_F(Marubackupd, RaisesItsDescriptorLimitAboveTheServersOwn) {
