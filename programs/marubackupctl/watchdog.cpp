@@ -1,29 +1,24 @@
 #include "watchdog.h"
 
+#include <pthread.h>
 #include <signal.h>
-#include <time.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
-#include <cstdint>
-#include <system_error>
+#include <chrono>
+#include <mutex>
+#include <thread>
 
 #include "shared/daemon_socket.h"
 
 namespace {
 
-const std::int64_t NANOSECONDS = 1000000000;
-/** How soon it is noticed that the daemon has gone. */
-const std::int64_t LOOK_EVERY = NANOSECONDS / 5;
+using Clock = std::chrono::steady_clock;
 
-// What the handlers use. They run on the one thread there is, between set-up
-// and the end, while nobody else touches it.
-LastWords lateWords;
-LastWords goneWords;
-LastWords interruptWords;
-std::int64_t deadline = 0;
-timer_t timer;
+/** How soon it is noticed that the daemon has gone. */
+const Clock::duration LOOK_EVERY = std::chrono::milliseconds(200);
+/** Tells the thread that the guard has changed. */
+const int WAKE_UP = SIGALRM;
 
 [[noreturn]] void endWith(const LastWords& words) {
     // Nobody is left to tell if this fails.
@@ -32,72 +27,90 @@ timer_t timer;
     _exit(words.status);
 }
 
-std::int64_t now() {
-    timespec time = {};
-    clock_gettime(CLOCK_MONOTONIC, &time);
-    return time.tv_sec * NANOSECONDS + time.tv_nsec;
-}
-
-void startTimer() {
-    const std::int64_t pause = std::clamp<std::int64_t>(deadline - now(), 1, LOOK_EVERY);
-    itimerspec once = {};
-    once.it_value.tv_sec = pause / NANOSECONDS;
-    once.it_value.tv_nsec = pause % NANOSECONDS;
-    timer_settime(timer, 0, &once, nullptr);
-}
-
-// The handlers, and what they call above, use only what is safe in a handler.
-
-void look(int) {
-    const int callersErrno = errno;
-    if (!isDaemonThere()) {
-        endWith(goneWords);
+/** The thread that watches, and what it is told. Never destroyed, since the thread lasts as long as the process. */
+class Watcher {
+public:
+    Watcher(const LastWords& onInterrupt, const sigset_t& awaited) : interrupted(onInterrupt), signals(awaited) {
+        thread = std::thread(&Watcher::watch, this);
     }
-    if (now() >= deadline) {
-        endWith(lateWords);
+
+    void guard(double seconds, const LastWords& onLate, const LastWords& onGone) {
+        const std::lock_guard<std::mutex> lock(mutex);
+        late = onLate;
+        gone = onGone;
+        deadline = Clock::now() + std::chrono::duration_cast<Clock::duration>(std::chrono::duration<double>(seconds));
+        guarding = true;
+        pthread_kill(thread.native_handle(), WAKE_UP);
     }
-    startTimer();
-    errno = callersErrno;
-}
 
-void interrupted(int) {
-    endWith(interruptWords);
-}
+    void leave() {
+        const std::lock_guard<std::mutex> lock(mutex);
+        guarding = false;
+    }
 
-void handle(int signal, void (*handler)(int)) {
-    struct sigaction action = {};
-    action.sa_handler = handler;
-    action.sa_flags = SA_RESTART;
-    sigaction(signal, &action, nullptr);
-    sigset_t unblocked;
-    sigemptyset(&unblocked);
-    sigaddset(&unblocked, signal);
-    sigprocmask(SIG_UNBLOCK, &unblocked, nullptr);
+private:
+    [[noreturn]] void watch() {
+        while (true) {
+            const auto pause = std::chrono::duration_cast<std::chrono::nanoseconds>(look());
+            const timespec rest = {pause.count() / 1000000000, pause.count() % 1000000000};
+            if (sigtimedwait(&signals, nullptr, &rest) == SIGINT) {
+                endWith(interrupted);
+            }
+        }
+    }
+
+    /** Ends the process if it is time to; how long until the next look. */
+    Clock::duration look() {
+        const std::lock_guard<std::mutex> lock(mutex);
+        if (!guarding) {
+            return LOOK_EVERY;
+        }
+        if (!isDaemonThere()) {
+            endWith(gone);
+        }
+        const Clock::time_point now = Clock::now();
+        if (now >= deadline) {
+            endWith(late);
+        }
+        return std::min(LOOK_EVERY, deadline - now);
+    }
+
+    const LastWords interrupted;
+    const sigset_t signals;
+    std::mutex mutex;
+    bool guarding = false;
+    LastWords late;
+    LastWords gone;
+    Clock::time_point deadline;
+    std::thread thread;
+};
+
+Watcher* watcher = nullptr;
+
+bool isIgnored(int signal) {
+    struct sigaction inherited = {};
+    sigaction(signal, nullptr, &inherited);
+    return inherited.sa_handler == SIG_IGN;
 }
 
 } // namespace
 
-Watchdog::Watchdog(double seconds, const LastWords& late, const LastWords& gone) {
-    lateWords = late;
-    goneWords = gone;
-    deadline = now() + static_cast<std::int64_t>(seconds * static_cast<double>(NANOSECONDS));
-    handle(SIGALRM, look);
-    if (timer_create(CLOCK_MONOTONIC, nullptr, &timer) != 0) {
-        throw std::system_error(errno, std::generic_category(), "cannot make a timer");
+void startWatching(const LastWords& interrupted) {
+    sigset_t awaited;
+    sigemptyset(&awaited);
+    sigaddset(&awaited, WAKE_UP);
+    if (!isIgnored(SIGINT)) {
+        sigaddset(&awaited, SIGINT);
     }
-    startTimer();
+    // No thread takes them but the one that waits for them.
+    pthread_sigmask(SIG_BLOCK, &awaited, nullptr);
+    watcher = new Watcher(interrupted, awaited);
+}
+
+Watchdog::Watchdog(double seconds, const LastWords& late, const LastWords& gone) {
+    watcher->guard(seconds, late, gone);
 }
 
 Watchdog::~Watchdog() {
-    handle(SIGALRM, SIG_IGN);
-    timer_delete(timer);
-}
-
-void endOnInterrupt(const LastWords& words) {
-    struct sigaction inherited = {};
-    sigaction(SIGINT, nullptr, &inherited);
-    if (inherited.sa_handler != SIG_IGN) {
-        interruptWords = words;
-        handle(SIGINT, interrupted);
-    }
+    watcher->leave();
 }

@@ -10,10 +10,17 @@ struct LastWords {
 };
 
 /**
+ * Starts the thread that watches over this one, which it ends with `interrupted`
+ * on SIGINT, unless whoever started the program ignores that signal. Once, before
+ * any other thread there is.
+ */
+void startWatching(const LastWords& interrupted);
+
+/**
  * Guards a call into the library, which has no time-out: as long as the object
  * lives, the process is ended when `seconds` have passed, with `late`, or when
  * the daemon has gone, with `gone`. (A call whose daemon went away in the middle
- * of it would not return.) One at a time.
+ * of it would not return.) One at a time, and after startWatching().
  */
 class Watchdog {
 public:
@@ -22,6 +29,3 @@ public:
     Watchdog(const Watchdog&) = delete;
     Watchdog& operator=(const Watchdog&) = delete;
 };
-
-/** Ends the process with `words` on SIGINT, unless whoever started it ignores that signal. */
-void endOnInterrupt(const LastWords& words);
