@@ -255,11 +255,12 @@ TEST_F(CommandClientConnection, IsNotTriedToALongerPath) {
 }
 
 TEST_F(CommandClientConnection, FailsWhereTheProcessMayOpenNoMoreDescriptors) {
-    const pid_t child = startInChild([&]() {
+    const std::string socket = path;
+    const pid_t child = startInChild([&socket]() {
         const rlimit none = {0, 0};
         setrlimit(RLIMIT_NOFILE, &none);
         CommandClient other;
-        return other.connect(path) || other.isConnected() ? 1 : 0;
+        return other.connect(socket) || other.isConnected() ? 1 : 0;
     });
 
     EXPECT_EQ("exit 0", end(child));

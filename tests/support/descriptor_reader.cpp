@@ -58,6 +58,10 @@ void DescriptorReader::resumeAll() {
     }
 }
 
+void DescriptorReader::forgetAll() {
+    readers.clear();
+}
+
 void DescriptorReader::start() {
     sigset_t all;
     sigset_t old;

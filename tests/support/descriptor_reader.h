@@ -20,13 +20,14 @@ public:
     DescriptorReader(const DescriptorReader&) = delete;
     DescriptorReader& operator=(const DescriptorReader&) = delete;
 
-    // Between these two calls no reader of the process has a thread, so that
-    // what is forked there comes from a process of a single one: in any other
-    // the thread sanitizer no longer delivers signals. What arrives meanwhile
-    // is read afterwards.
+    // Between these calls no reader of the process has a thread, so that what
+    // is forked there comes from a process of a single one: in any other the
+    // thread sanitizer no longer delivers signals. What arrives meanwhile is
+    // read afterwards. The child has no readers.
 
     static void pauseAll();
     static void resumeAll();
+    static void forgetAll();
 
 private:
     void start();

@@ -37,6 +37,7 @@ pid_t startInChild(Body body) {
         throw std::system_error(error, std::generic_category(), "fork");
     }
     if (child == 0) {
+        DescriptorReader::forgetAll();
         int status = CHILD_THREW;
         try {
             status = body();

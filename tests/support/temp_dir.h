@@ -15,9 +15,10 @@ namespace support {
  */
 class TempDir {
 public:
-    TempDir() {
-        const char* base = getenv("TMPDIR");
-        folder = std::string(base && *base ? base : "/tmp") + "/marubackup-test-XXXXXX";
+    TempDir() : TempDir(usualBase()) {
+    }
+    /** Below `base`, for a test that needs a certain file system. */
+    explicit TempDir(const std::string& base) : folder(base + "/marubackup-test-XXXXXX") {
         if (!mkdtemp(&folder[0])) {
             throw std::system_error(errno, std::generic_category(), "mkdtemp " + folder);
         }
@@ -39,6 +40,11 @@ public:
     }
 
 private:
+    static std::string usualBase() {
+        const char* const base = getenv("TMPDIR");
+        return base && *base ? base : "/tmp";
+    }
+
     std::string folder;
 };
 
