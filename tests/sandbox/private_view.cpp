@@ -82,6 +82,16 @@ void mountRun() {
     makeFolder("/run/tmp", 01777);
 }
 
+/** Of what the host's /tmp holds there is only what `workingFolder` stands in, if it stands there. */
+void mountTmp(const fs::path& workingFolder) {
+    const fs::path inside = workingFolder.lexically_relative("/tmp");
+    coverFolder("/tmp");
+    check(chmod("/tmp", 01777), "chmod /tmp");
+    if (!inside.empty() && *inside.begin() != ".." && *inside.begin() != ".") {
+        bindEntry(*inside.begin(), "/tmp");
+    }
+}
+
 /** A terminal made inside is made here: the host's devpts often lets only the host's root make one. */
 void mountPts() {
     makeFolder("/dev/pts");
@@ -126,6 +136,7 @@ void makePrivateView() {
     keepMountsFromTheHost();
     mountProc();
     mountRun();
+    mountTmp(workingFolder);
     mountDev();
     mountProductFolders();
     check(chdir(workingFolder.c_str()), "stay, inside, in ", workingFolder);
