@@ -1,6 +1,7 @@
 #include "common/json_text.h"
 
 #include <algorithm>
+#include <charconv>
 #include <cstddef>
 #include <memory>
 #include <sstream>
@@ -75,14 +76,46 @@ bool skipNumber(const std::string& text, std::size_t& at) {
     return true;
 }
 
-/** Advances `at` behind the string there; false if it has a raw control character. */
+/** The number in the escape \uXXXX at `at`; -1 if there is none. */
+int escapedNumber(const std::string& text, std::size_t at) {
+    if (at + 6 > text.size() || text.compare(at, 2, "\\u") != 0) {
+        return -1;
+    }
+    int number = 0;
+    const char* const end = text.data() + at + 6;
+    return std::from_chars(text.data() + at + 2, end, number, 16).ptr == end ? number : -1;
+}
+
+bool isHighSurrogate(int number) {
+    return number >= 0xD800 && number <= 0xDBFF;
+}
+
+bool isLowSurrogate(int number) {
+    return number >= 0xDC00 && number <= 0xDFFF;
+}
+
+/** Advances `at` behind the escape there; false if it is half a character alone. */
+bool skipEscape(const std::string& text, std::size_t& at) {
+    const int number = escapedNumber(text, at);
+    at += number < 0 ? 2 : 6;
+    if (!isHighSurrogate(number)) {
+        return !isLowSurrogate(number);
+    }
+    const bool whole = isLowSurrogate(escapedNumber(text, at));
+    at += 6;
+    return whole;
+}
+
+/** Advances `at` behind the string there; false if it has a raw control character or half a character. */
 bool skipString(const std::string& text, std::size_t& at) {
-    for (++at; at < text.size() && text[at] != '"'; ++at) {
+    for (++at; at < text.size() && text[at] != '"';) {
         if (static_cast<unsigned char>(text[at]) < 0x20) {
             return false;
         }
-        if (text[at] == '\\') {
+        if (text[at] != '\\') {
             ++at;
+        } else if (!skipEscape(text, at)) {
+            return false;
         }
     }
     ++at;
@@ -101,7 +134,8 @@ bool countNesting(char c, int& depth) {
 
 /**
  * jsoncpp reads numbers like 01, 1. and +1, raw control characters in strings,
- * comments in some places also where they are not allowed, and takes a NUL for
+ * comments in some places also where they are not allowed, makes one character
+ * of any two escapes of which the first is a high surrogate, and takes a NUL for
  * the end of the text. This finds what it lets pass; the structure is the
  * reader's to judge.
  */
