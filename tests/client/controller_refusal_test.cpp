@@ -38,6 +38,24 @@ std::string complaintOfNoCode(const Call& call, const std::string& reply) {
     return call.complaint == Complaint::OF_ADDING ? "controller.cpp: addJob failed." : complaintOfNoJson(call, reply);
 }
 
+/** A reply whose member "job" holds a job with so many arrays in one another; itself it is two levels more. */
+std::string replyWithNesting(std::size_t arrays) {
+    return "{\"code\":200,\"job\":{\"action\":1,\"backend\":\"b\",\"param\":{\"a\":" + std::string(arrays, '[') +
+           std::string(arrays, ']') + "},\"status\":1},\"jobs\":[]}";
+}
+
+/** Members "job" that are none, each with the comma before it. */
+const char* const JOBS_THAT_ARE_NONE[] = {"",
+                                          ",\"job\":null",
+                                          ",\"job\":true",
+                                          ",\"job\":7",
+                                          ",\"job\":1.5",
+                                          ",\"job\":\"\"",
+                                          ",\"job\":\"{}\"",
+                                          ",\"job\":[]",
+                                          ",\"job\":[{}]",
+                                          ",\"jobs\":[{}]"};
+
 TEST(BadArguments, AJobThatCannotBeEnqueuedIsNotSent) {
     ErrorLog log;
     FakeDaemon daemon;
@@ -98,10 +116,24 @@ TEST(UnreadableReplies, TextThatIsNotJsonIsAnInternalError) {
                                    "{\"code\":200",
                                    "{\"code\":200}x",
                                    "{\"code\":200}{\"code\":200}",
+                                   "{\"code\":200,}",
                                    "{\"code\":0200}",
+                                   "{\"code\":1e400}",
+                                   "{\"code\":-1e400}",
+                                   "{\"code\":NaN}",
                                    "{code:200}",
+                                   "{\"code\":200,\"\\ud83d\":0}",
+                                   "{\"code\":200,\"x\":\"\\ude00\"}",
+                                   "\xef\xbb\xbf{\"code\":200}",
+                                   "\xff",
                                    "100%s %n",
-                                   " "};
+                                   " ",
+                                   std::string(5000, '['),
+                                   std::string(5000, '"'),
+                                   std::string(5000, '9'),
+                                   std::string(5000, '\xff'),
+                                   "[" + std::string(2500, '[') + std::string(2500, ']') + "]",
+                                   replyWithNesting(62)};
     for (const Call& call : everyCall()) {
         for (const std::string& reply : REPLIES) {
             SCOPED_TRACE(call.name + (" " + reply));
@@ -110,6 +142,15 @@ TEST(UnreadableReplies, TextThatIsNotJsonIsAnInternalError) {
             EXPECT_THAT(log.take(), ElementsAre(complaintOfNoJson(call, reply)));
         }
     }
+}
+
+TEST(UnreadableReplies, AReplyIsReadUpToTheLimitOfNesting) {
+    const FakeDaemon daemon({replyWithNesting(61), replyWithNesting(62)});
+    JobController controller;
+    Outputs outputs;
+    EXPECT_EQ(200, controller.getJob(1, outputs.job));
+    EXPECT_EQ("b", outputs.job.getBackend());
+    EXPECT_EQ(500, controller.getJob(1, outputs.job));
 }
 
 TEST(UnreadableReplies, AnEmptyReplyIsAnInternalError) {
@@ -124,15 +165,22 @@ TEST(UnreadableReplies, AnEmptyReplyIsAnInternalError) {
     }
 }
 
-TEST(UnreadableReplies, TextBehindANulIsAnInternalErrorAndLoggedUpToIt) {
+TEST(UnreadableReplies, TextWithANulIsAnInternalErrorAndLoggedUpToIt) {
     ErrorLog log;
     FakeDaemon daemon;
     JobController controller;
+    const struct {
+        std::string before;
+        std::string behind;
+    } REPLIES[] = {{"{\"code\":200}", "{}"},          {"{\"code\":200}", ""},       {"", "{\"code\":200}"}, {"", ""},
+                   {"{\"code\":200,\"x\":\"", "\"}"}, {"", std::string(5000, '\0')}};
     for (const Call& call : everyCall()) {
-        SCOPED_TRACE(call.name);
-        daemon.addReply(std::string("{\"code\":200}\0{}", 15));
-        expectFailure(500, call, controller);
-        EXPECT_THAT(log.take(), ElementsAre(complaintOfNoJson(call, "{\"code\":200}")));
+        for (const auto& reply : REPLIES) {
+            SCOPED_TRACE(call.name + (" " + reply.before));
+            daemon.addReply(reply.before + '\0' + reply.behind);
+            expectFailure(500, call, controller);
+            EXPECT_THAT(log.take(), ElementsAre(complaintOfNoJson(call, reply.before)));
+        }
     }
 }
 
@@ -150,15 +198,20 @@ TEST(UnreadableReplies, AReplyWithoutAnIntegerCodeIsAnInternalError) {
     ErrorLog log;
     FakeDaemon daemon;
     JobController controller;
-    const std::string REPLIES[] = {// no object at all
-                                   "null", "true", "200", "0.5", "\"200\"", "[]", "[200]", "[{\"code\":200}]",
-                                   // no code
-                                   "{}", "{\"Code\":200}", "{\"reply\":{\"code\":200}}", "{\"job\":{},\"jobs\":[]}",
-                                   // a code of another type
-                                   "{\"code\":null}", "{\"code\":true}", "{\"code\":200.0}", "{\"code\":2e2}",
-                                   "{\"code\":\"200\"}", "{\"code\":[200]}", "{\"code\":{\"code\":200}}",
-                                   "{\"code\":4294967496}", "{\"code\":-2147483649}",
-                                   "{\"code\":\"200\",\"job\":{},\"jobs\":[]}"};
+    const std::string REPLIES[] = {
+        // no object at all
+        "null", "true", "false", "200", "0.5", "\"200\"", "\"\"", "[]", "[200]", "[{\"code\":200}]",
+        std::string(64, '[') + std::string(64, ']'),
+        // no code
+        "{}", "{\"Code\":200}", "{\"code\\u0000\":200}", "{\"reply\":{\"code\":200}}", "{\"job\":{},\"jobs\":[]}",
+        // a code of another type
+        "{\"code\":null}", "{\"code\":true}", "{\"code\":false}", "{\"code\":200.0}", "{\"code\":200.5}",
+        "{\"code\":2e2}", "{\"code\":\"200\"}", "{\"code\":\"\"}", "{\"code\":[]}", "{\"code\":[200]}", "{\"code\":{}}",
+        "{\"code\":{\"code\":200}}", "{\"code\":200,\"code\":\"200\"}", "{\"code\":\"200\",\"job\":{},\"jobs\":[]}",
+        // a code that is no int
+        "{\"code\":2147483648}", "{\"code\":-2147483649}", "{\"code\":4294967496}", "{\"code\":-4294967096}",
+        "{\"code\":9223372036854775808}", "{\"code\":18446744073709551615}", "{\"code\":18446744073709551816}",
+        "{\"code\":1e308}", "{\"code\":-1e308}", "{\"code\":4294967496,\"job\":{},\"jobs\":[]}"};
     for (const Call& call : everyCall()) {
         for (const std::string& reply : REPLIES) {
             SCOPED_TRACE(call.name + (" " + reply));
@@ -173,7 +226,7 @@ TEST(UnreadableReplies, AnAdmittedJobThatIsNoObjectIsAnInternalError) {
     ErrorLog log;
     FakeDaemon daemon;
     JobController controller;
-    for (const char* member : {"", ",\"job\":null", ",\"job\":[]", ",\"job\":\"{}\"", ",\"job\":7", ",\"jobs\":[{}]"}) {
+    for (const char* member : JOBS_THAT_ARE_NONE) {
         SCOPED_TRACE(member);
         daemon.addReply("{\"code\":200" + std::string(member) + "}");
         Outputs outputs;
@@ -187,7 +240,7 @@ TEST(UnreadableReplies, AFoundJobThatIsNoObjectIsAnInternalErrorAndNotLogged) {
     ErrorLog log;
     FakeDaemon daemon;
     JobController controller;
-    for (const char* member : {"", ",\"job\":null", ",\"job\":[]", ",\"job\":\"{}\"", ",\"job\":7", ",\"jobs\":[{}]"}) {
+    for (const char* member : JOBS_THAT_ARE_NONE) {
         SCOPED_TRACE(member);
         daemon.addReply("{\"code\":200" + std::string(member) + "}");
         Outputs outputs;
@@ -206,7 +259,11 @@ TEST(UnreadableReplies, AListThatIsNoArrayIsAnInternalErrorAndNoEmptyList) {
                                    "{\"code\":200,\"jobs\":{}}",
                                    "{\"code\":200,\"jobs\":{\"0\":{}}}",
                                    "{\"code\":200,\"jobs\":\"[]\"}",
+                                   "{\"code\":200,\"jobs\":\"\"}",
                                    "{\"code\":200,\"jobs\":1}",
+                                   "{\"code\":200,\"jobs\":1.5}",
+                                   "{\"code\":200,\"jobs\":true}",
+                                   "{\"code\":200,\"jobs\":[{}],\"jobs\":{}}",
                                    "{\"code\":200,\"job\":[]}"};
     for (const Call& call : everyCall()) {
         if (!call.fillsList && call.name != std::string("getJobByUnique")) {

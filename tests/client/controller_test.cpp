@@ -265,14 +265,20 @@ TEST(ListJobs, HaveAnEmptyJobForEachElementThatCannotBeRead) {
     ErrorLog log;
     const std::string empty = Job().toString();
     const std::string good = jobText("b", 1);
-    const FakeDaemon daemon({"{\"code\":200,\"jobs\":[" + good +
-                             ",5,null,\"text\",[],{},{\"backend\":\"b\",\"job_id\":5,\"unique\":\"u\"},"
-                             "{\"action\":1,\"backend\":\"b\",\"job_id\":5,\"param\":[],\"status\":1}]}"});
-    std::list<Job> jobs;
-
-    EXPECT_EQ(200, JobController().listJobAll(jobs));
-
-    EXPECT_THAT(texts(jobs), ElementsAre(good, empty, empty, empty, empty, empty, empty, empty));
+    for (const Call& call : everyCall()) {
+        if (call.fillsList) {
+            const FakeDaemon daemon({"{\"code\":200,\"jobs\":[" + good +
+                                     ",5,1.5,null,true,\"text\",[],[{}],[[[]]],{},"
+                                     "{\"backend\":\"b\",\"job_id\":5,\"unique\":\"u\"},"
+                                     "{\"action\":1,\"backend\":\"b\",\"job_id\":5,\"param\":[],\"status\":1}]}"});
+            JobController controller;
+            Outputs outputs;
+            EXPECT_EQ(200, call.make(controller, outputs)) << call.name;
+            EXPECT_THAT(texts(outputs.jobs),
+                        ElementsAre(good, empty, empty, empty, empty, empty, empty, empty, empty, empty, empty, empty))
+                << call.name;
+        }
+    }
     EXPECT_THAT(log.take(), IsEmpty());
 }
 
@@ -310,6 +316,17 @@ TEST(GetJobByUnique, FillsTheJobThatIsFound) {
     EXPECT_EQ(200, JobController().getJobByUnique(outputs.job, "b.1", Job::ACTION_BACKUP));
 
     EXPECT_EQ(jobText("b", 1), outputs.job.toString()) << "nothing of the old job is left";
+    EXPECT_THAT(log.take(), IsEmpty());
+}
+
+TEST(GetJobByUnique, FindsAnEmptyJobInAnElementThatCannotBeRead) {
+    ErrorLog log;
+    for (const char* element : {"5", "1.5", "null", "true", "\"text\"", "[]", "[{}]", "{}", "{\"backend\":\"b\"}"}) {
+        const FakeDaemon daemon({"{\"code\":200,\"jobs\":[" + std::string(element) + "]}"});
+        Outputs outputs;
+        EXPECT_EQ(200, JobController().getJobByUnique(outputs.job, "u", Job::ACTION_BACKUP)) << element;
+        EXPECT_EQ(Job().toString(), outputs.job.toString()) << element;
+    }
     EXPECT_THAT(log.take(), IsEmpty());
 }
 
