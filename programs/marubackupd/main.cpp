@@ -54,7 +54,8 @@ int main(int argc, char** argv) {
     openMissingStandardDescriptors();
     // The lines of the diary stay whole, also beside those of jobs that share it.
     std::setvbuf(stderr, nullptr, _IOLBF, BUFSIZ);
-    openlog("marubackupd", LOG_PID, LOG_DAEMON);
+    // Connected at once: a lack of descriptors has to be reported too.
+    openlog("marubackupd", LOG_PID | LOG_NDELAY, LOG_DAEMON);
 
     bool debug = false;
     CLI::App app("Queues backup jobs and runs them, in the foreground, until it is told to end by SIGTERM.\n"
