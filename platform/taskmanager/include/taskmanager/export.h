@@ -1,0 +1,4 @@
+#pragma once
+
+/** Marks what `libtaskmanager.so.6` exports. */
+#define TASKMANAGER_API __attribute__((visibility("default")))
