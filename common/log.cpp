@@ -9,21 +9,39 @@
 namespace MARU {
 namespace Backup {
 
+namespace {
+
+/** Logs behind `prefix`, which has no percent sign; `error` is what "%m" stands for, and errno afterwards. */
+void logBehind(const char* prefix, int error, int priority, const char* unit, int line, const char* format,
+               va_list arguments) {
+    // Prefixes, units and formats are short literals of ours, so this holds any
+    // of them; the arguments, which can be of any length, are left to vsyslog.
+    char whole[256];
+    std::snprintf(whole, sizeof whole, "%s%s:%d %s", prefix, unit, line, format);
+    errno = error;
+    vsyslog(priority, whole, arguments);
+    errno = error;
+}
+
+} // namespace
+
 void logLocated(int priority, const char* unit, int line, const char* format, ...) {
     const int callersErrno = errno;
-
-    // Formats are short literals of ours, so this holds any of them; the
-    // arguments, which can be of any length, are left to vsyslog.
-    char located[256];
-    std::snprintf(located, sizeof located, "(%d) [%s] %s:%d %s", static_cast<int>(getpid()),
-                  priority == LOG_DEBUG ? "debug" : "err", unit, line, format);
-
+    char prefix[32];
+    std::snprintf(prefix, sizeof prefix, "(%d) [%s] ", static_cast<int>(getpid()),
+                  priority == LOG_DEBUG ? "debug" : "err");
     va_list arguments;
     va_start(arguments, format);
-    errno = callersErrno;
-    vsyslog(priority, located, arguments);
+    logBehind(prefix, callersErrno, priority, unit, line, format, arguments);
     va_end(arguments);
-    errno = callersErrno;
+}
+
+void logPlain(int priority, const char* unit, int line, const char* format, ...) {
+    const int callersErrno = errno;
+    va_list arguments;
+    va_start(arguments, format);
+    logBehind("", callersErrno, priority, unit, line, format, arguments);
+    va_end(arguments);
 }
 
 } // namespace Backup

@@ -13,6 +13,9 @@ namespace Backup {
 void logLocated(int priority, const char* unit, int line, const char* format, ...)
     __attribute__((format(printf, 4, 5)));
 
+/** The same without process id and level: "unit:line message". */
+void logPlain(int priority, const char* unit, int line, const char* format, ...) __attribute__((format(printf, 4, 5)));
+
 } // namespace Backup
 } // namespace MARU
 
@@ -20,3 +23,4 @@ void logLocated(int priority, const char* unit, int line, const char* format, ..
 // "%m" is one of syslog's extensions, hence __extension__.
 #define LOG_LOCATED_ERR(...) __extension__ ::MARU::Backup::logLocated(LOG_ERR, LOG_UNIT, __LINE__, __VA_ARGS__)
 #define LOG_LOCATED_DEBUG(...) __extension__ ::MARU::Backup::logLocated(LOG_DEBUG, LOG_UNIT, __LINE__, __VA_ARGS__)
+#define LOG_PLAIN_ERR(...) __extension__ ::MARU::Backup::logPlain(LOG_ERR, LOG_UNIT, __LINE__, __VA_ARGS__)

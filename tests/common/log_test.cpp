@@ -42,6 +42,20 @@ TEST(LocatedLog, ADebugLineHasItsOwnPriorityAndMark) {
     EXPECT_EQ(located(getpid(), "debug", line, "connect to [somewhere]"), log.lines()[0].message);
 }
 
+TEST(PlainLog, AnErrorNamesUnitAndLineAlone) {
+    support::SyslogSocket log;
+
+    errno = EACCES;
+    LOG_PLAIN_ERR("no room for [%s], %d left: %m", "job%d", 7);
+    const int line = __LINE__ - 1;
+
+    EXPECT_EQ(EACCES, errno);
+    ASSERT_EQ(1U, log.lines().size());
+    EXPECT_EQ(LOG_ERR, log.lines()[0].priority);
+    EXPECT_EQ("log_test:" + std::to_string(line) + " no room for [job%d], 7 left: Permission denied",
+              log.lines()[0].message);
+}
+
 TEST(LocatedLog, TakesUnitAndLineFromACallerThatGivesThem) {
     support::SyslogSocket log;
 

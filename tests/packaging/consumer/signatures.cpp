@@ -93,6 +93,15 @@ static_assert(has<int (JobController::*)(Jobs, String), &JobController::listJobB
 static_assert(has<int (JobController::*)(Jobs, String, String), &JobController::listJobByFormatString>);
 static_assert(has<int (JobController::*)(Job&, String, Job::Action), &JobController::getJobByUnique>);
 
+static_assert(has<bool (*)(Job::Action&), &System::canBackup> && has<bool (*)(), &System::canBackup>);
+static_assert(has<bool (*)(Job::Action&), &System::canRestore> && has<bool (*)(), &System::canRestore>);
+static_assert(has<bool (*)(Job::Action&), &System::canCopyTo> && has<bool (*)(), &System::canCopyTo>);
+static_assert(has<bool (*)(String), &System::isBackupRunning> && has<bool (*)(String), &System::isRestoreRunning> &&
+              has<bool (*)(String), &System::isCopyToRunning>);
+static_assert(has<bool (*)(String), &System::isBackupRunningNotQueued>);
 static_assert(has<bool (*)(String), &System::isRestoreRunningNotQueued>);
+static_assert(has<bool (*)(String), &System::isCopyToRunningNotQueued>);
+
+
 
 } // namespace
