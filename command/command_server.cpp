@@ -422,11 +422,14 @@ bool CommandServer::run(const RequestHandler& handler, const std::string& socket
 bool CommandServer::setTimeout(const TimeoutHandler& callback, timeval delay, void* argument) {
     auto* const record = new TimeoutRecord{callback, argument};
     event* const timer = event_new(d->eventBase, -1, 0, timeoutCallback, record);
-    if (timer == nullptr || event_add(timer, &delay) != 0) {
-        LOG_LOCATED_ERR("add timeout event failed");
-        return false;
+    if (timer != nullptr && event_add(timer, &delay) == 0) {
+        return true;
     }
-    return true;
+    LOG_LOCATED_ERR("add timeout event failed");
+    if (timer != nullptr) {
+        event_free(timer);
+    }
+    return false;
 }
 
 bool CommandServer::setLoopHandler(const LoopHandler& handler) {

@@ -4,6 +4,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <cstring>
@@ -13,6 +14,7 @@
 #include <marubackup/backend_manager.h>
 #include <marubackup/command_server.h>
 #include <marubackup/job.h>
+#include <marubackup/timed_session.h>
 
 #include "command/protocol.h"
 #include "common/log.h"
@@ -33,6 +35,8 @@ const std::string BACKEND_SUFFIX = ".conf";
 const int SOCKET_MODE = 0660;
 const int KILL_WAITS = 5;
 const int EXIT_NOT_LAUNCHED = 127;
+/** 34 years: as good as for ever, and the loop can add it to its clock where a time has 32 bits. */
+const long LONGEST_DELAY = 1L << 30;
 
 /**
  * How many jobs of a queue may have a process at once, in the order of the scan:
@@ -239,6 +243,29 @@ bool queue_kill_all_job() {
         queue_foreach_job(sendSignalCb, &signal);
     }
     return true;
+}
+
+// Sessions
+
+timeval delayOfSeconds(long seconds) {
+    timeval delay = {};
+    delay.tv_sec = static_cast<time_t>(std::clamp(seconds, 0L, LONGEST_DELAY));
+    return delay;
+}
+
+void cleanSessionTimeout(void* argument) {
+    auto* const context = static_cast<CleanSessionContext*>(argument);
+    const long left = TimedSession::destroyExpired(context->sessionId, context->lifetime, true);
+    if (left > 0) {
+        if (!context->server->setTimeout(cleanSessionTimeout, delayOfSeconds(left), context)) {
+            queueLog(LOG_ERR, "failed to setTimeout for clean session job");
+        }
+        return;
+    }
+    if (left < 0) {
+        LOG_LOCATED_ERR("failed to destroy expired session[%s][%ld]", context->sessionId.c_str(), context->lifetime);
+    }
+    delete context;
 }
 
 // The daemon

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <sys/time.h>
+
 #include <string>
 
 #include "queue/job_queues.h"
@@ -7,9 +9,10 @@
 namespace MARU {
 namespace Backup {
 
+class CommandServer;
 class Job;
 
-// Scheduling and supervision of the jobs in the store.
+// Scheduling and supervision of the jobs in the store, and what the timers do.
 
 /** Starts whatever may be started now. Always true. */
 bool queue_scan_next_to_launch();
@@ -48,6 +51,23 @@ QueueIterControl sendSignalCb(const std::string& queueName, Job& job, bool& remo
  * for those that are still there. Always true.
  */
 bool queue_kill_all_job();
+
+/** A session that is to be cleaned up. It belongs to its timer. */
+struct CleanSessionContext {
+    std::string sessionId;
+    long lifetime; ///< seconds
+    CommandServer* server;
+};
+
+/**
+ * Destroys a session if it has expired, and otherwise has itself called again
+ * when it will have. `context` points at a CleanSessionContext, which is freed
+ * unless there is another call to come, or one that could not be arranged.
+ */
+void cleanSessionTimeout(void* context);
+
+/** The delay that a timer takes for that many seconds: none for what is past. */
+timeval delayOfSeconds(long seconds);
 
 } // namespace Backup
 } // namespace MARU

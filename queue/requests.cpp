@@ -1,10 +1,14 @@
 #include "queue/requests.h"
 
+#include <sys/time.h>
 #include <syslog.h>
+
+#include <cstdint>
 
 #include <json/value.h>
 
 #include <marubackup/backend_manager.h>
+#include <marubackup/command_server.h>
 #include <marubackup/job.h>
 #include <marubackup/system_status.h>
 
@@ -239,6 +243,49 @@ void handleJobList(const Json::Value& request, Json::Value& reply, CommandServer
     }
 }
 
+// clean_session
+
+/** The id as text. False if it is neither text nor a number. */
+bool readSessionId(const Json::Value& request, std::string& id) {
+    const Json::Value& value = member(request, Member::SESSION_ID);
+    if (!value.isString() && !value.isNumeric()) {
+        return false;
+    }
+    id = value.asString();
+    return true;
+}
+
+/** The low 32 bits of an integer of up to 64, as a signed number. False if it is none. */
+bool readLifetime(const Json::Value& request, long& lifetime) {
+    const Json::Value& value = member(request, Member::LIFETIME);
+    if (value.type() != Json::intValue && value.type() != Json::uintValue) {
+        return false;
+    }
+    const std::uint64_t bits =
+        value.type() == Json::intValue ? static_cast<std::uint64_t>(value.asInt64()) : value.asUInt64();
+    lifetime = static_cast<std::int32_t>(static_cast<std::uint32_t>(bits));
+    return true;
+}
+
+void handleCleanSession(const Json::Value& request, Json::Value& reply, CommandServer* server) {
+    std::string id;
+    long lifetime = 0;
+    if (!readSessionId(request, id) || !readLifetime(request, lifetime)) {
+        refuse(reply, CODE_BAD_REQUEST);
+        queueLog(LOG_ERR, "get bad sessin clean job request");
+        return;
+    }
+    auto* const context = new CleanSessionContext{id, lifetime, server};
+    if (!server->setTimeout(cleanSessionTimeout, delayOfSeconds(lifetime), context)) {
+        // The timer that could not be added may hold on to the context, which
+        // is left alone.
+        refuse(reply, CODE_INTERNAL);
+        queueLog(LOG_ERR, "failed to setTimeout for clean session job");
+        return;
+    }
+    reply[Member::SESSION_ID] = id;
+}
+
 // Dispatch
 
 struct OpHandler {
@@ -246,12 +293,15 @@ struct OpHandler {
     void (*handle)(const Json::Value& request, Json::Value& reply, CommandServer* server);
 };
 
+// clang-format off
 const OpHandler opHandlerTable[] = {
     {Op::JOB_ENQUEUE, handleJobEnqueue},
     {Op::JOB_REMOVE, handleJobRemove},
     {Op::JOB_GET, handleJobGet},
     {Op::JOB_LIST, handleJobList},
+    {Op::CLEAN_SESSION, handleCleanSession},
 };
+// clang-format on
 
 const OpHandler* findHandler(const std::string& op) {
     for (const OpHandler& row : opHandlerTable) {

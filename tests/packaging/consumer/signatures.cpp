@@ -19,6 +19,7 @@
 #include <marubackup/job.h>
 #include <marubackup/queue_server.h>
 #include <marubackup/system_status.h>
+#include <marubackup/timed_session.h>
 
 using namespace MARU::Backup;
 using String = const std::string&;
@@ -102,6 +103,14 @@ static_assert(has<bool (*)(String), &System::isBackupRunningNotQueued>);
 static_assert(has<bool (*)(String), &System::isRestoreRunningNotQueued>);
 static_assert(has<bool (*)(String), &System::isCopyToRunningNotQueued>);
 
+static_assert(std::is_default_constructible_v<TimedSession> && !std::is_copy_constructible_v<TimedSession>);
+static_assert(TimedSession::TEMP_DEFAULT == 0 && TimedSession::TEMP_MAX_VOLUME == 1);
+static_assert(has<bool (TimedSession::*)(TimedSession::TempType, long), &TimedSession::create>);
+static_assert(has<bool (TimedSession::*)(String), &TimedSession::load>);
+static_assert(has<std::string (TimedSession::*)() const, &TimedSession::getId> &&
+              has<std::string (TimedSession::*)() const, &TimedSession::getPath>);
+static_assert(has<bool (TimedSession::*)(), &TimedSession::destroy>);
+static_assert(has<long (*)(String, long, bool), &TimedSession::destroyExpired>);
 
 
 } // namespace
