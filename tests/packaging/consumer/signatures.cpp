@@ -17,6 +17,7 @@
 #include <marubackup/command_server.h>
 #include <marubackup/controller.h>
 #include <marubackup/job.h>
+#include <marubackup/maru_archive_version.h>
 #include <marubackup/queue_server.h>
 #include <marubackup/system_status.h>
 #include <marubackup/timed_session.h>
@@ -112,5 +113,9 @@ static_assert(has<std::string (TimedSession::*)() const, &TimedSession::getId> &
 static_assert(has<bool (TimedSession::*)(), &TimedSession::destroy>);
 static_assert(has<long (*)(String, long, bool), &TimedSession::destroyExpired>);
 
+static_assert(has<int (*)(const char*, unsigned*), &MARUBackupArchVerGet>);
+static_assert(has<int (*)(const char*, unsigned*), &MARUBackupFSArchVerGet>);
+static_assert(has<int (*)(const char*, unsigned*), &MARUBackupFSArchVerIncrease>);
+static_assert(has<int (*)(const char*, unsigned), &MARUBackupFileArchVerSet>);
 
 } // namespace

@@ -1,0 +1,45 @@
+#pragma once
+
+#include <sys/types.h>
+
+#include <cstdint>
+#include <memory>
+#include <string>
+
+#include "support/temp_dir.h"
+
+/**
+ * A file system with an archive version, mounted in the sandbox for as long as the
+ * object lives. archive_version_fs.cpp tells what is in it.
+ */
+class ArchiveMount {
+public:
+    /** None, with the reason in `reason`, where no such file system can be mounted. */
+    static std::unique_ptr<ArchiveMount> make(std::string& reason);
+
+    ~ArchiveMount();
+    ArchiveMount(const ArchiveMount&) = delete;
+    ArchiveMount& operator=(const ArchiveMount&) = delete;
+
+    /** Its root. */
+    const std::string& path() const {
+        return folder.path();
+    }
+    /** `name` in it. */
+    std::string path(const std::string& name) const {
+        return folder.path(name);
+    }
+
+    /** The version as the file system itself has it. */
+    std::uint32_t version() const;
+    /** Sets one of the things that its control file knows. */
+    void set(const std::string& name, std::int64_t number) const;
+
+private:
+    ArchiveMount() = default;
+    /** What it says before it is mounted, or instead. */
+    std::string start();
+
+    support::TempDir folder;
+    pid_t server = -1;
+};
