@@ -23,6 +23,12 @@ int askDaemon(const Request& request, const Globals& globals);
 /** The same, with a time-out in seconds and a message for it of the caller's. */
 int askDaemon(const Request& request, const Globals& globals, double seconds, const std::string& lateMessage);
 
+/**
+ * Asks `question` of the library, which may ask the daemon if there is one. The
+ * tool ends here as it does in askDaemon().
+ */
+void askLibrary(const std::function<void()>& question, const Globals& globals);
+
 /** "2.5 seconds" */
 std::string inSeconds(double seconds);
 

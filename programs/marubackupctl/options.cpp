@@ -17,7 +17,7 @@ const char EXIT_STATUSES[] = R"(Exit status:
   0    done
   1    something else failed
   2    wrong usage
-  3    no such job
+  3    no such job or session
   4    refused by a rule of the daemon or the backend
   5    the daemon cannot be reached
   124  timed out
@@ -50,6 +50,13 @@ std::string checkSeconds(const std::string& text) {
 std::string checkTimeout(const std::string& text) {
     const std::string mistake = checkSeconds(text);
     return mistake.empty() && std::stod(text) <= 0 ? "must be more than 0 seconds" : mistake;
+}
+
+std::string checkLifetime(const std::string& text) {
+    long seconds = 0;
+    const char* end = text.data() + text.size();
+    const auto [rest, error] = std::from_chars(text.data(), end, seconds);
+    return error == std::errc() && rest == end ? "" : "\"" + text + "\" is no whole number of seconds";
 }
 
 std::string checkNotEmpty(const std::string& text) {
@@ -101,7 +108,8 @@ void defineGlobals(CLI::App& app, Globals& globals) {
     app.get_help_ptr()->description("print this help and exit");
     app.set_version_flag("--version", "marubackupctl " MARUBACKUP_VERSION, "print the version and exit");
     app.add_flag("--json", globals.json, "write data as one line of JSON; a failure as {\"code\":…,\"reason\":…}");
-    app.add_option("--timeout", globals.timeout, "the longest that one exchange with the daemon may take")
+    app.add_option("--timeout", globals.timeout,
+                   "the longest that one exchange with the daemon, or a file system, may take")
         ->option_text("SECONDS (10)")
         ->check(checkTimeout);
 }
@@ -194,6 +202,108 @@ void defineBackends(CLI::App& app, Options& options) {
     verb->callback([&options] { options.verb = BackendsVerb(); });
 }
 
+void defineStatus(CLI::App& app, Options& options) {
+    CLI::App* verb =
+        addVerb(app, "status", "tell what may start now, and what is at work",
+                "A daemon that cannot be reached counts as one without jobs, as it does for applications.");
+    const auto status = std::make_shared<StatusVerb>();
+    verb->add_option("--backend", status->backend, "whether this one is at work, not any")
+        ->option_text("BACKEND")
+        ->check(checkNotEmpty);
+    verb->callback([&options, status] { options.verb = *status; });
+}
+
+/** The lifetime is read as a text, since CLI11 takes 010 for 8. */
+CLI::Option* addLifetime(CLI::App& verb, std::string& text, const std::string& description) {
+    return verb.add_option("--lifetime", text, description)->option_text("SECONDS")->check(checkLifetime);
+}
+
+void addSessionId(CLI::App& verb, std::string& id) {
+    verb.add_option("ID", id, "the session's id")->option_text(" ")->required()->check(checkNotEmpty);
+}
+
+void defineSessionCreate(CLI::App& session, Options& options) {
+    CLI::App* verb = addVerb(session, "create", "make a session, and print its id",
+                             "The daemon removes it when it has not been used for its lifetime.");
+    const auto create = std::make_shared<SessionCreateVerb>();
+    const auto lifetime = std::make_shared<std::string>();
+    addLifetime(*verb, *lifetime, "how long it lasts unused; 259200, three days, at most")->required();
+    verb->add_flag("--max-volume", create->onMaxVolume, "on the volume with the most free space");
+    verb->callback([&options, create, lifetime] {
+        create->lifetime = std::stol(*lifetime);
+        options.verb = *create;
+    });
+}
+
+void defineSessionPath(CLI::App& session, Options& options) {
+    CLI::App* verb = addVerb(session, "path", "print the directory of a session");
+    const auto path = std::make_shared<SessionPathVerb>();
+    addSessionId(*verb, path->id);
+    verb->callback([&options, path] { options.verb = *path; });
+}
+
+void defineSessionDestroy(CLI::App& session, Options& options) {
+    CLI::App* verb = addVerb(session, "destroy", "remove a session with all that is in it");
+    const auto destroy = std::make_shared<SessionDestroyVerb>();
+    addSessionId(*verb, destroy->id);
+    verb->callback([&options, destroy] { options.verb = *destroy; });
+}
+
+void defineSessionExpire(CLI::App& session, Options& options) {
+    CLI::App* verb = addVerb(session, "expire", "remove a session that has expired, or print how long it has left",
+                             "It has expired when its directory was not changed, and no file in it read, for its\n"
+                             "lifetime. Prints the seconds that are left; 0 if it is gone.");
+    const auto expire = std::make_shared<SessionExpireVerb>();
+    const auto lifetime = std::make_shared<std::string>();
+    const auto ignoreFiles = std::make_shared<bool>(false);
+    addSessionId(*verb, expire->id);
+    addLifetime(*verb, *lifetime, "how long it lasts unused")->required();
+    verb->add_flag("--ignore-files", *ignoreFiles, "that a file was read does not count");
+    verb->callback([&options, expire, lifetime, ignoreFiles] {
+        expire->lifetime = std::stol(*lifetime);
+        expire->walkFiles = !*ignoreFiles;
+        options.verb = *expire;
+    });
+}
+
+void defineSession(CLI::App& app, Options& options) {
+    CLI::App* verb = addVerb(app, "session", "make, find and remove session directories");
+    verb->require_subcommand(1);
+    defineSessionCreate(*verb, options);
+    defineSessionPath(*verb, options);
+    defineSessionDestroy(*verb, options);
+    defineSessionExpire(*verb, options);
+}
+
+template <typename Verb>
+void defineArchiveVersionVerb(CLI::App& archiveVersion, Options& options, const std::string& name,
+                              const std::string& description, const std::string& details = "") {
+    CLI::App* verb = addVerb(archiveVersion, name, description, details);
+    const auto chosen = std::make_shared<Verb>();
+    verb->add_option("PATH", chosen->path, "a file or folder")->option_text(" ")->required()->check(checkNotEmpty);
+    verb->callback([&options, chosen] { options.verb = *chosen; });
+}
+
+void defineArchiveVersion(CLI::App& app, Options& options) {
+    CLI::App* verb = addVerb(app, "archive-version", "read or increase archive versions of files and file systems",
+                             "Where a version differs from the one that was noted down with the last archive, there\n"
+                             "is something to archive again.");
+    verb->require_subcommand(1);
+    defineArchiveVersionVerb<ArchiveVersionGetVerb>(*verb, options, "get",
+                                                    "print the archive version of a file or folder",
+                                                    "One that has none is at 0. A link is looked at itself.");
+    defineArchiveVersionVerb<ArchiveVersionFsGetVerb>(*verb, options, "fs-get",
+                                                      "print the archive version of the file system that PATH is on");
+    defineArchiveVersionVerb<ArchiveVersionFsIncreaseVerb>(
+        *verb, options, "fs-increase", "increase the archive version of the file system, and print the new one",
+        "If it is increased and then cannot be read, that is a failure too: look with fs-get.");
+}
+
+bool lacksVerb(const CLI::App& app) {
+    const std::vector<CLI::App*> chosen = app.get_subcommands();
+    return chosen.empty() ? app.get_require_subcommand_min() > 0 : lacksVerb(*chosen.front());
+}
+
 } // namespace
 
 std::optional<int> readOptions(int argc, char** argv, Options& options) {
@@ -206,6 +316,9 @@ std::optional<int> readOptions(int argc, char** argv, Options& options) {
     defineRemove(app, options);
     defineWait(app, options);
     defineBackends(app, options);
+    defineStatus(app, options);
+    defineSession(app, options);
+    defineArchiveVersion(app, options);
     try {
         app.parse(argc, argv);
         return std::nullopt;
@@ -216,8 +329,7 @@ std::optional<int> readOptions(int argc, char** argv, Options& options) {
             putData(out.str());
             return EXIT_DONE;
         }
-        const bool noVerb =
-            end.get_exit_code() == static_cast<int>(CLI::ExitCodes::RequiredError) && app.get_subcommands().empty();
+        const bool noVerb = end.get_exit_code() == static_cast<int>(CLI::ExitCodes::RequiredError) && lacksVerb(app);
         say((noVerb ? "a verb is missing, or is none of those that there are" : end.what()) + HINT);
         return EXIT_USAGE;
     }

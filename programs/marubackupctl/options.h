@@ -7,7 +7,10 @@
 
 struct Options {
     Globals globals;
-    std::variant<AddVerb, ListVerb, ShowVerb, RemoveVerb, WaitVerb, BackendsVerb> verb;
+    std::variant<AddVerb, ListVerb, ShowVerb, RemoveVerb, WaitVerb, BackendsVerb, StatusVerb, SessionCreateVerb,
+                 SessionPathVerb, SessionDestroyVerb, SessionExpireVerb, ArchiveVersionGetVerb, ArchiveVersionFsGetVerb,
+                 ArchiveVersionFsIncreaseVerb>
+        verb;
 };
 
 /**

@@ -58,3 +58,47 @@ int run(const WaitVerb& verb, const Globals& globals);
 
 struct BackendsVerb {};
 int run(const BackendsVerb& verb, const Globals& globals);
+
+struct StatusVerb {
+    /** The one whose work is asked about; empty: all. */
+    std::string backend;
+};
+int run(const StatusVerb& verb, const Globals& globals);
+
+struct SessionCreateVerb {
+    long lifetime = 0;
+    bool onMaxVolume = false;
+};
+int run(const SessionCreateVerb& verb, const Globals& globals);
+
+struct SessionPathVerb {
+    std::string id;
+};
+int run(const SessionPathVerb& verb, const Globals& globals);
+
+struct SessionDestroyVerb {
+    std::string id;
+};
+int run(const SessionDestroyVerb& verb, const Globals& globals);
+
+struct SessionExpireVerb {
+    std::string id;
+    long lifetime = 0;
+    bool walkFiles = true;
+};
+int run(const SessionExpireVerb& verb, const Globals& globals);
+
+struct ArchiveVersionGetVerb {
+    std::string path;
+};
+int run(const ArchiveVersionGetVerb& verb, const Globals& globals);
+
+struct ArchiveVersionFsGetVerb {
+    std::string path;
+};
+int run(const ArchiveVersionFsGetVerb& verb, const Globals& globals);
+
+struct ArchiveVersionFsIncreaseVerb {
+    std::string path;
+};
+int run(const ArchiveVersionFsIncreaseVerb& verb, const Globals& globals);

@@ -17,7 +17,7 @@ struct Row {
 // From the best news to the worst.
 const std::array<Row, 9> VERDICTS = {{
     {CODE_DONE, EXIT_DONE, "done"},
-    {CODE_NO_SUCH_JOB, EXIT_NO_SUCH_JOB, "no such job is waiting or running: it has ended, or never was"},
+    {CODE_NO_SUCH_JOB, EXIT_NO_SUCH_THING, "no such job is waiting or running: it has ended, or never was"},
     {409, EXIT_REFUSED,
      "the same work is waiting or running already: wait for that job or remove it (\"marubackupctl list\" shows it)"},
     {406, EXIT_REFUSED, "a restore is waiting or running: nothing can be added until it has ended"},

@@ -9,7 +9,7 @@ enum ExitStatus {
     EXIT_DONE = 0,
     EXIT_OTHER = 1,
     EXIT_USAGE = 2,
-    EXIT_NO_SUCH_JOB = 3,
+    EXIT_NO_SUCH_THING = 3,
     EXIT_REFUSED = 4,
     EXIT_NOT_REACHABLE = 5,
     EXIT_TIMED_OUT = 124,

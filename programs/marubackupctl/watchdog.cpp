@@ -34,7 +34,7 @@ public:
         thread = std::thread(&Watcher::watch, this);
     }
 
-    void guard(double seconds, const LastWords& onLate, const LastWords& onGone) {
+    void guard(double seconds, const LastWords& onLate, const std::optional<LastWords>& onGone) {
         const std::lock_guard<std::mutex> lock(mutex);
         late = onLate;
         gone = onGone;
@@ -65,8 +65,8 @@ private:
         if (!guarding) {
             return LOOK_EVERY;
         }
-        if (!isDaemonThere()) {
-            endWith(gone);
+        if (gone && !isDaemonThere()) {
+            endWith(*gone);
         }
         const Clock::time_point now = Clock::now();
         if (now >= deadline) {
@@ -80,7 +80,7 @@ private:
     std::mutex mutex;
     bool guarding = false;
     LastWords late;
-    LastWords gone;
+    std::optional<LastWords> gone;
     Clock::time_point deadline;
     std::thread thread;
 };
@@ -107,7 +107,7 @@ void startWatching(const LastWords& interrupted) {
     watcher = new Watcher(interrupted, awaited);
 }
 
-Watchdog::Watchdog(double seconds, const LastWords& late, const LastWords& gone) {
+Watchdog::Watchdog(double seconds, const LastWords& late, const std::optional<LastWords>& gone) {
     watcher->guard(seconds, late, gone);
 }
 

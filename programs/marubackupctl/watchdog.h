@@ -1,5 +1,6 @@
 #pragma once
 
+#include <optional>
 #include <string>
 
 /** What to write, and the exit status, when the process is ended at an unforeseen point. */
@@ -19,12 +20,13 @@ void startWatching(const LastWords& interrupted);
 /**
  * Guards a call into the library, which has no time-out: as long as the object
  * lives, the process is ended when `seconds` have passed, with `late`, or when
- * the daemon has gone, with `gone`. (A call whose daemon went away in the middle
- * of it would not return.) One at a time, and after startWatching().
+ * the daemon has gone, with `gone` if that is given. (A call whose daemon went
+ * away in the middle of it would not return.) One at a time, and after
+ * startWatching().
  */
 class Watchdog {
 public:
-    Watchdog(double seconds, const LastWords& late, const LastWords& gone);
+    Watchdog(double seconds, const LastWords& late, const std::optional<LastWords>& gone);
     ~Watchdog();
     Watchdog(const Watchdog&) = delete;
     Watchdog& operator=(const Watchdog&) = delete;

@@ -10,82 +10,17 @@
 #include <json/reader.h>
 #include <json/value.h>
 
-#include "daemon_test.h"
 #include "support/backend_files.h"
 #include "support/fake_daemon.h"
 #include "support/files.h"
 #include "support/in_child.h"
 #include "support/socket_peer.h"
 #include "support/waiting.h"
+#include "tool_test.h"
 
 using namespace MARU::Backup;
-using Arguments = std::vector<std::string>;
 
-namespace {
-
-/** What the tool printed and how it ended. */
-struct Outcome {
-    std::string ended;
-    std::string out;
-    std::string err;
-};
-
-class Marubackupctl : public DaemonTest {
-protected:
-    /** Starts the tool in the background. */
-    pid_t startTool(const Arguments& arguments) {
-        return support::startInChild([&]() {
-            redirect(STDOUT_FILENO, "out");
-            redirect(STDERR_FILENO, "err");
-            std::vector<char*> argv = {const_cast<char*>("marubackupctl")};
-            for (const std::string& argument : arguments) {
-                argv.push_back(const_cast<char*>(argument.c_str()));
-            }
-            argv.push_back(nullptr);
-            execv(MARUBACKUPCTL, argv.data());
-            return 126;
-        });
-    }
-
-    Outcome finish(pid_t tool) {
-        const std::string ended = support::describeStatus(support::waitForChild(tool));
-        return {ended, support::readFile(folder.path("out")), support::readFile(folder.path("err"))};
-    }
-
-    Outcome run(const Arguments& arguments) {
-        return finish(startTool(arguments));
-    }
-
-    /** Waits until the tool sleeps in the kernel, as it does when the daemon does not answer. */
-    static void awaitItsSleep(pid_t tool) {
-        const std::string process = "/proc/" + std::to_string(tool);
-        EXPECT_TRUE(support::waitUntil([&process]() {
-            return support::readFile(process + "/comm") == "marubackupctl\n" &&
-                   support::readFile(process + "/status").find("State:\tS") != std::string::npos;
-        }));
-    }
-
-    /** Adds, by the tool, a backup that waits at `gate`; the id that it printed. */
-    std::string addHeld(support::Gate& gate) {
-        const Outcome outcome = run({"add", "gated", "backup", "-p", "gate=" + gate.path()});
-        EXPECT_EQ("exit 0", outcome.ended) << outcome.err;
-        return outcome.out.substr(0, outcome.out.find('\n'));
-    }
-
-    static Json::Value parse(const std::string& text) {
-        Json::Value value;
-        const std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
-        EXPECT_TRUE(reader->parse(text.data(), text.data() + text.size(), &value, nullptr)) << text;
-        return value;
-    }
-
-private:
-    void redirect(int descriptor, const std::string& name) {
-        dup2(open(folder.path(name).c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600), descriptor);
-    }
-};
-
-} // namespace
+using Marubackupctl = ToolTest;
 
 TEST_F(Marubackupctl, AddPrintsTheIdAloneAndHandsTheParametersOver) {
     start();
