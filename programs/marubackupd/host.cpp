@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <array>
+#include <csignal>
 #include <string>
 
 #include "report.h"
@@ -21,6 +22,12 @@ const gid_t SOCKET_GROUP = 101;
 const std::array<const char*, 6> ADMINISTRATORS = {"administrators", "admin", "adm", "sudo", "wheel", "root"};
 
 } // namespace
+
+void unblockSignals() {
+    sigset_t none;
+    sigemptyset(&none);
+    sigprocmask(SIG_SETMASK, &none, nullptr);
+}
 
 void raiseDescriptorLimit() {
     rlimit limit = {};
