@@ -33,9 +33,10 @@ int becomeDaemon(const DaemonOptions& options, int diary) {
     return 126;
 }
 
+/** Answered, it has set up everything else too: it listens before it watches its folder. */
 bool answers() {
     try {
-        const SocketPeer peer;
+        SocketPeer().ask("{\"op\":\"job_list\"}");
         return true;
     } catch (const std::system_error&) {
         return false;

@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <csignal>
 #include <filesystem>
 #include <iterator>
 #include <sstream>
@@ -40,6 +41,10 @@ bool waitUntil(const std::function<bool()>& condition) {
         std::this_thread::sleep_for(std::chrono::milliseconds(5));
     }
     return true;
+}
+
+bool isGone(int pid) {
+    return kill(pid, 0) != 0;
 }
 
 std::chrono::milliseconds cpuTime(int pid) {

@@ -21,6 +21,9 @@ bool waitReadable(int fd, std::chrono::milliseconds limit = PATIENCE);
  */
 bool waitUntil(const std::function<bool()>& condition);
 
+/** Whether the process `pid` is gone, without a trace. */
+bool isGone(int pid);
+
 /** The processor time that the process `pid` has used so far. */
 std::chrono::milliseconds cpuTime(int pid);
 

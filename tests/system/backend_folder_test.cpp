@@ -9,6 +9,7 @@
 #include <filesystem>
 
 #include "daemon_test.h"
+#include "raw_requests.h"
 #include "support/backend_files.h"
 #include "support/files.h"
 #include "support/socket_peer.h"
@@ -165,7 +166,7 @@ TEST_F(BackendFolder, WhatComesWhileTheDaemonIsBusyIsReportedAfterwards) {
                                            gate.path() + "\n");
     daemon->waitForLine("new backend [slow]");
     support::SocketPeer peer;
-    peer.write(support::frame("{\"op\":\"job_enqueue\",\"job\":" + Job("slow", Job::ACTION_BACKUP).toString() + "}"));
+    peer.write(support::frame(enqueueRequest(Job("slow", Job::ACTION_BACKUP))));
     gate.awaitJob();
     const std::vector<std::string> names = manyNames(1000);
     for (const std::string& name : names) {

@@ -23,6 +23,7 @@
 #include <json/json.h>
 
 #include "daemon_test.h"
+#include "raw_requests.h"
 #include "support/descriptor_limit.h"
 #include "support/files.h"
 #include "support/named_rows.h"
@@ -46,7 +47,6 @@ const std::size_t BUFFER_SIZE = 16384;
 const std::string REFUSED_LENGTH("\x80\0\0\0", 4);
 const int HIGHEST_SERVED = 1024;
 
-const std::string LIST = "{\"op\":\"job_list\"}";
 const std::string UNKNOWN_JOB = "{\"op\":\"job_get\",\"job_id\":99999}";
 const std::string NOT_FOUND = "{\"code\":404}";
 const std::string BAD_REQUEST = "{\"code\":400}";
@@ -57,7 +57,7 @@ std::string tooLong() {
 }
 
 std::string getJob(int id) {
-    return "{\"op\":\"job_get\",\"job_id\":" + std::to_string(id) + "}";
+    return requestFor("job_get", id);
 }
 
 Peers connect(int number) {
@@ -160,7 +160,7 @@ protected:
     /** Jobs whose list is far more than a socket takes at once; the size of that list. */
     std::size_t fillQueueWithMegabytes() {
         fillQueue(200, std::string(15000, 'x'));
-        const std::size_t size = other->ask(LIST).size();
+        const std::size_t size = other->ask(LIST_REQUEST).size();
         EXPECT_LT(std::size_t{200} * 15000, size);
         return size;
     }
@@ -326,7 +326,7 @@ TEST_F(Connections, GarbageBetweenRequestsIsAnsweredInItsPlace) {
     addGated(Job::ACTION_BACKUP, newGate());
     SocketPeer peer;
 
-    peer.write(frame(getJob(1)) + frame("\xFF garbage \x80") + frame("") + frame(LIST) +
+    peer.write(frame(getJob(1)) + frame("\xFF garbage \x80") + frame("") + frame(LIST_REQUEST) +
                frame(std::string(1000, '\0')) + frame("{\"op\":\"job_dance\"}") + frame(UNKNOWN_JOB));
 
     EXPECT_EQ(0U, peer.readFrame().rfind("{\"code\":200,\"job\":{", 0));
@@ -356,11 +356,11 @@ TEST_F(Connections, OfAClientThatWritesByteByByteDoNotHoldUpTheOthers) {
 TEST_F(Connections, OfAClientThatLeavesTenMegabytesUnreadDoNotHoldUpTheOthers) {
     const int jobs = 700;
     fillQueue(jobs, std::string(15000, 'x'));
-    const std::string list = other->ask(LIST);
+    const std::string list = other->ask(LIST_REQUEST);
     EXPECT_LT(std::size_t{10} << 20, list.size());
     SocketPeer slow;
 
-    slow.write(frame(LIST));
+    slow.write(frame(LIST_REQUEST));
     ASSERT_TRUE(support::waitReadable(slow.descriptor()));
     for (int count = 0; count < 20; ++count) {
         EXPECT_TRUE(othersAreServed());
@@ -415,7 +415,7 @@ TEST_P(ConnectionInMidReply, LeavesNothingBehindWhenItsClientGoes) {
     const std::size_t size = fillQueueWithMegabytes();
     const int before = settledDescriptors();
     SocketPeer peer;
-    peer.write(frame(LIST) + GetParam().said);
+    peer.write(frame(LIST_REQUEST) + GetParam().said);
     EXPECT_EQ(size / 10, peer.read(size / 10).size());
 
     GetParam().leave(peer, daemon->pid());
@@ -429,7 +429,7 @@ INSTANTIATE_TEST_SUITE_P(
     HowItsClient, ConnectionInMidReply,
     testing::Values(Departure{"ClosesWithBytesUnread", "", closeWithBytesUnread},
                     Departure{"ClosesWithAllRead", "", closeWithAllRead}, Departure{"EndsItsOutput", "", endOutput},
-                    Departure{"ClosesWithASecondReplyToCome", frame(LIST), closeWithAllRead},
+                    Departure{"ClosesWithASecondReplyToCome", frame(LIST_REQUEST), closeWithAllRead},
                     Departure{"ClosesAfterARequestTooLong", tooLong(), closeWithBytesUnread},
                     Departure{"ClosesWithAllReadAfterARequestTooLong", tooLong(), closeWithAllRead}),
     support::NameOfRow());

@@ -61,12 +61,12 @@ const Text TEXTS[] = {
     {"Comment", filled("*", "/*", "*/"), 400},
     {"LongText", filled("a", "\"", "\""), 400},
 
-    {"RequestBehindANul", NUL + LIST, 400},
-    {"NulBehindARequest", LIST + NUL, 400},
-    {"ByteOrderMark", "\xef\xbb\xbf" + LIST, 400},
-    {"TwoRequests", LIST + LIST, 400},
-    {"HalfARequest", LIST.substr(0, LIST.size() - 1), 400},
-    {"RequestInAnArray", "[" + LIST + "]", 400},
+    {"RequestBehindANul", NUL + LIST_REQUEST, 400},
+    {"NulBehindARequest", LIST_REQUEST + NUL, 400},
+    {"ByteOrderMark", "\xef\xbb\xbf" + LIST_REQUEST, 400},
+    {"TwoRequests", LIST_REQUEST + LIST_REQUEST, 400},
+    {"HalfARequest", LIST_REQUEST.substr(0, LIST_REQUEST.size() - 1), 400},
+    {"RequestInAnArray", "[" + LIST_REQUEST + "]", 400},
 
     {"NestedOperation", filled("[", "{\"op\":"), 400},
     {"NestedFilter", filled("[", "{\"op\":\"job_list\",\"backend\":"), 400},

@@ -44,7 +44,7 @@ HostileTest::HostileTest() {
     peer = std::make_unique<SocketPeer>();
     // Refused with a line in syslog, to which the daemon is connected from then on.
     EXPECT_EQ(refusal(505), peer->ask(enqueue(jobOf("unheard-of"))));
-    queues = peer->ask(LIST);
+    queues = peer->ask(LIST_REQUEST);
     children = childrenOfDaemon();
     descriptors = support::openDescriptors(daemon->pid());
     launches = countLaunches();
@@ -65,8 +65,8 @@ void HostileTest::expectCode(int code, const std::string& request) {
 }
 
 void HostileTest::expectUnharmed(int launchedSince) {
-    EXPECT_EQ(queues, peer->ask(LIST));
-    EXPECT_EQ(queues, SocketPeer().ask(LIST));
+    EXPECT_EQ(queues, peer->ask(LIST_REQUEST));
+    EXPECT_EQ(queues, SocketPeer().ask(LIST_REQUEST));
     EXPECT_EQ(launches + launchedSince, countLaunches());
     EXPECT_EQ(children, childrenOfDaemon());
     EXPECT_TRUE(support::waitUntil([this]() { return support::openDescriptors(daemon->pid()) == descriptors; }))

@@ -5,15 +5,13 @@
 #include <string>
 
 #include "daemon_test.h"
+#include "raw_requests.h"
 #include "support/socket_peer.h"
 
 // Requests written by hand, and a daemon at work that they are sent to.
 
 /** The longest request that the daemon can take. */
 const std::size_t MAX_REQUEST = 16380;
-
-/** Asks for all jobs. */
-const std::string LIST = "{\"op\":\"job_list\"}";
 
 /** One byte of zero. */
 const std::string NUL(1, '\0');

@@ -171,7 +171,7 @@ TEST_F(MarubackupctlSession, IsToldInJsonToo) {
 
 TEST_F(MarubackupctlSession, IsGoneAfterItsLifetime) {
     start();
-    const std::string path = pathOf(create("1"));
+    const std::string path = parse(run({"session", "create", "--lifetime", "1", "--json"}).out)["path"].asString();
     EXPECT_TRUE(support::waitUntil([&path]() { return access(path.c_str(), F_OK) != 0; }));
     EXPECT_TRUE(support::waitUntil([]() { return count() == 0; }));
 }
