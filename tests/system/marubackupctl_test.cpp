@@ -1,15 +1,19 @@
 // The operator's tool, as a shell sees it: what it prints, and its exit status.
 
 #include <fcntl.h>
+#include <sys/socket.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <csignal>
+#include <filesystem>
+#include <memory>
 
 #include <json/reader.h>
 #include <json/value.h>
 
+#include "raw_requests.h"
 #include "support/backend_files.h"
 #include "support/fake_daemon.h"
 #include "support/files.h"
@@ -182,9 +186,56 @@ TEST_F(Marubackupctl, ADaemonThatGoesAwayBeforeItsAnswerIsStatusFive) {
     EXPECT_EQ("exit 5", finish(tool).ended);
 }
 
+namespace {
+
+/** The connection over which the tool has asked for a list. Its others only look whether somebody serves. */
+std::unique_ptr<support::SocketPeer> acceptList(int listener) {
+    const std::string request = support::frame(LIST_REQUEST);
+    while (true) {
+        auto peer = std::make_unique<support::SocketPeer>(accept(listener, nullptr, nullptr));
+        if (peer->read(request.size()) == request) {
+            return peer;
+        }
+    }
+}
+
+} // namespace
+
+TEST_F(Marubackupctl, ADaemonThatGoesAwayInTheMiddleOfItsAnswerIsStatusFive) {
+    const std::string answer = support::frame("{\"code\":200,\"jobs\":[]}");
+    for (const std::size_t sent : {std::size_t{2}, std::size_t{4}, std::size_t{9}, answer.size() - 1}) {
+        const int listener = support::listenAt(support::DAEMON_SOCKET);
+        const pid_t tool = startTool({"list"});
+        acceptList(listener)->write(answer.substr(0, sent));
+        close(listener);
+        std::filesystem::remove(support::DAEMON_SOCKET);
+        const Outcome outcome = finish(tool);
+        EXPECT_EQ("exit 5", outcome.ended) << sent;
+        EXPECT_EQ("", outcome.out);
+        EXPECT_EQ("marubackupctl: the daemon ended meanwhile: nobody answers at /var/run/marubackupd.socket: start "
+                  "marubackupd, or, if it runs, ask as root or as a member of the socket's group\n",
+                  outcome.err);
+    }
+}
+
+TEST_F(Marubackupctl, AnAnswerThatAnotherDaemonWillNotFinishTimesOut) {
+    const int listener = support::listenAt(support::DAEMON_SOCKET); // serves on, as one that was started anew does
+    const pid_t tool = startTool({"list", "--timeout", "0.5"});
+    acceptList(listener)->write(support::frame("{\"code\":200}").substr(0, 7));
+    EXPECT_EQ("exit 124", finish(tool).ended);
+    close(listener);
+}
+
 TEST_F(Marubackupctl, AnAnswerThatCannotBeReadIsStatusOne) {
-    const support::FakeDaemon nonsense({"nonsense"});
-    EXPECT_EQ("exit 1", run({"list"}).ended);
+    for (const char* answer : {"nonsense", "", "[]", "{}", "{\"code\":\"200\"}", "{\"code\":200}", "{\"code\":999}"}) {
+        const support::FakeDaemon strange({answer});
+        const Outcome outcome = run({"list"});
+        EXPECT_EQ("exit 1", outcome.ended) << answer;
+        EXPECT_EQ("", outcome.out) << answer;
+        EXPECT_NE(std::string::npos,
+                  outcome.err.find("the daemon failed, or its answer cannot be read: see the system log"))
+            << answer << ": " << outcome.err;
+    }
 }
 
 TEST_F(Marubackupctl, AnInterruptedOneIsStatus130) {
