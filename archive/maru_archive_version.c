@@ -29,8 +29,12 @@ static const int FAILED = -1;
 #define LOG_PLAIN_ERR(text) syslog(LOG_ERR, "%s:%d " text, LOG_UNIT, __LINE__)
 #define SET_ERROR(code) MLIBCErrSetEx(code, LOG_UNIT ".c", __LINE__)
 
-/** A descriptor; negative, with errno and the error slot filled, if there is none. */
+/** A descriptor; negative, with the error slot filled, if there is none (errno says why the path has none). */
 static int openForRequests(const char* path) {
+    if (path == NULL) {
+        SET_ERROR(MLIBC_ERR_BAD_PARAMETER);
+        return FAILED;
+    }
     // Without O_CLOEXEC a program that another thread starts meanwhile would
     // inherit the descriptor, and hold the file system busy.
     const int fd = open(path, O_RDONLY | O_CLOEXEC);
@@ -64,10 +68,6 @@ int MARUBackupArchVerGet(const char* path, unsigned int* version) {
 }
 
 int MARUBackupFSArchVerGet(const char* path, unsigned int* version) {
-    if (path == NULL) {
-        SET_ERROR(MLIBC_ERR_BAD_PARAMETER);
-        return FAILED;
-    }
     const int fd = openForRequests(path);
     if (fd < 0) {
         return FAILED;
@@ -80,10 +80,6 @@ int MARUBackupFSArchVerGet(const char* path, unsigned int* version) {
 }
 
 int MARUBackupFSArchVerIncrease(const char* path, unsigned int* version) {
-    if (path == NULL) {
-        SET_ERROR(MLIBC_ERR_BAD_PARAMETER);
-        return FAILED;
-    }
     const int fd = openForRequests(path);
     if (fd < 0) {
         return FAILED;
@@ -102,8 +98,6 @@ int MARUBackupFileArchVerSet(const char* path, unsigned int version) {
     (void)version; // this platform has no use for it
     if (path == NULL) {
         LOG_PLAIN_ERR("Input bad parameter.");
-        SET_ERROR(MLIBC_ERR_BAD_PARAMETER);
-        return FAILED;
     }
     const int fd = openForRequests(path);
     if (fd < 0) {

@@ -20,6 +20,8 @@
 
 #include <marubackup-util/path.h>
 
+#include "shared/spawn_plan.h"
+
 namespace MARU {
 namespace Backup {
 
@@ -36,7 +38,6 @@ namespace {
 const char DEFAULT_SEARCH_PATH[] = "/bin:/usr/bin";
 const int OUTPUT_FLAGS = O_WRONLY | O_CREAT | O_APPEND | O_NOCTTY;
 const mode_t OUTPUT_MODE = 0640;
-const int FIRST_OTHER_DESCRIPTOR = STDERR_FILENO + 1;
 
 const std::size_t MAX_SHOWN = 200;
 
@@ -173,62 +174,31 @@ private:
     std::vector<std::string> variables;
 };
 
-/** What posix_spawn() does in the child between its start and the program. */
-class SpawnPlan {
-public:
-    SpawnPlan() {
-        posix_spawn_file_actions_init(&actions);
-        posix_spawnattr_init(&attributes);
-    }
-    ~SpawnPlan() {
-        posix_spawnattr_destroy(&attributes);
-        posix_spawn_file_actions_destroy(&actions);
-    }
-    SpawnPlan(const SpawnPlan&) = delete;
-    SpawnPlan& operator=(const SpawnPlan&) = delete;
+/** Has the program write to that file; 0, or an error number. */
+int openFile(SpawnPlan& plan, int descriptor, const std::string& path) {
+    return posix_spawn_file_actions_addopen(&plan.actions, descriptor, path.c_str(), OUTPUT_FLAGS, OUTPUT_MODE);
+}
 
-    /** Signals as they are by default, and a process group of its own. 0, or an error number. */
-    int resetSignals() {
-        // sigfillset() leaves out the two signals that glibc keeps to itself,
-        // and posix_spawn() would have the program start with those ignored.
-        sigset_t all;
-        std::memset(&all, 0xff, sizeof all);
-        sigset_t none;
-        sigemptyset(&none);
-        posix_spawnattr_setsigdefault(&attributes, &all);
-        posix_spawnattr_setsigmask(&attributes, &none);
-        return posix_spawnattr_setflags(&attributes,
-                                        POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETPGROUP);
+/** 0, or an error number. */
+int setDescriptors(SpawnPlan& plan, const SubProcessPrivate& d) {
+    int error = 0;
+    if (d.stdOutput) {
+        error = openFile(plan, STDOUT_FILENO, *d.stdOutput);
     }
-
-    /** 0, or an error number. */
-    int setDescriptors(const SubProcessPrivate& d) {
-        int error = 0;
-        if (d.stdOutput) {
-            error = open(STDOUT_FILENO, *d.stdOutput);
-        }
-        if (error == 0 && d.stdError) {
-            error = d.stdError == d.stdOutput ? posix_spawn_file_actions_adddup2(&actions, STDOUT_FILENO, STDERR_FILENO)
-                                              : open(STDERR_FILENO, *d.stdError);
-        }
-        return error ? error : posix_spawn_file_actions_addclosefrom_np(&actions, FIRST_OTHER_DESCRIPTOR);
+    if (error == 0 && d.stdError) {
+        error = d.stdError == d.stdOutput
+                    ? posix_spawn_file_actions_adddup2(&plan.actions, STDOUT_FILENO, STDERR_FILENO)
+                    : openFile(plan, STDERR_FILENO, *d.stdError);
     }
-
-    posix_spawn_file_actions_t actions;
-    posix_spawnattr_t attributes;
-
-private:
-    int open(int descriptor, const std::string& path) {
-        return posix_spawn_file_actions_addopen(&actions, descriptor, path.c_str(), OUTPUT_FLAGS, OUTPUT_MODE);
-    }
-};
+    return error ? error : plan.closeOtherDescriptors();
+}
 
 /** Starts `program`; 0, or an error number. */
 int spawn(const SubProcessPrivate& d, const Program& program, pid_t& child) {
     SpawnPlan plan;
-    int error = plan.resetSignals();
+    int error = plan.resetSignals(POSIX_SPAWN_SETPGROUP);
     if (error == 0) {
-        error = plan.setDescriptors(d);
+        error = setDescriptors(plan, d);
     }
     if (error == 0) {
         error = posix_spawn(&child, program.path.c_str(), &plan.actions, &plan.attributes, program.argv.data(),

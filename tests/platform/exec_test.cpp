@@ -20,6 +20,7 @@
 
 #include "support/files.h"
 #include "support/in_child.h"
+#include "support/signals.h"
 #include "support/temp_dir.h"
 
 using support::describeStatus;
@@ -39,29 +40,6 @@ void expectFailure(int code, int result) {
     EXPECT_STREQ("exec.cpp", MLIBCErrorGetFile());
     EXPECT_GT(MLIBCErrorGetLine(), 0);
     MLIBCErrSetEx(MLIBC_ERR_NONE, nullptr, 0);
-}
-
-void ignoreSignalHandled(int) {
-}
-
-void handle(int signalNumber, void (*handler)(int)) {
-    struct sigaction action = {};
-    action.sa_handler = handler; // and not SA_RESTART
-    sigaction(signalNumber, &action, nullptr);
-}
-
-/** Blocks all signals, and ignores or handles all but SIGCHLD, also those that glibc keeps to itself. */
-void changeAllSignals() {
-    const unsigned long ignored[8] = {1};
-    for (int signalNumber = 1; signalNumber < _NSIG; ++signalNumber) {
-        if (signalNumber != SIGCHLD) {
-            syscall(SYS_rt_sigaction, signalNumber, ignored, nullptr, _NSIG / 8);
-        }
-    }
-    handle(SIGTERM, ignoreSignalHandled);
-    sigset_t all;
-    sigfillset(&all);
-    sigprocmask(SIG_SETMASK, &all, nullptr);
 }
 
 /** For children made for a test. */
@@ -137,7 +115,7 @@ TEST_F(AnExecutedProgram, HasNoExitStatusIfASignalEndedIt) {
 
 TEST_F(AnExecutedProgram, StartsWithDefaultSignalsAndNoneBlocked) {
     const int status = runInChild([this] {
-        changeAllSignals();
+        support::changeAllSignals();
         writeOutputTo(out);
         return MLIBCExec("/bin/cat", "/proc/self/status", nullptr);
     });
@@ -191,7 +169,7 @@ TEST_F(AnExecutedProgram, IsWaitedForWhateverSignalsArrive) {
 
     const int status = runInChild([&] {
         listener = open(fifo.c_str(), O_RDWR | O_CLOEXEC);
-        handle(SIGALRM, countTick);
+        support::handleSignal(SIGALRM, countTick);
         const itimerval everyMillisecond = {{0, 1000}, {0, 1000}};
         setitimer(ITIMER_REAL, &everyMillisecond, nullptr);
         return runShell("read line < " + fifo + "; exit 5");
@@ -202,7 +180,7 @@ TEST_F(AnExecutedProgram, IsWaitedForWhateverSignalsArrive) {
 
 TEST_F(AnExecutedProgram, HasNoExitStatusIfItsCallerKeepsNone) {
     const int status = runInChild([] {
-        handle(SIGCHLD, SIG_IGN);
+        support::handleSignal(SIGCHLD, SIG_IGN);
         return runShell("exit 1") < 0 && MLIBCErrGet() == MLIBC_ERR_EXEC ? 0 : 1;
     });
     EXPECT_EQ("exit 0", describeStatus(status));

@@ -17,6 +17,7 @@
 
 #include "support/files.h"
 #include "support/in_child.h"
+#include "support/signals.h"
 #include "support/syscall_filter.h"
 #include "support/temp_dir.h"
 
@@ -115,30 +116,6 @@ std::string field(const std::string& text, const std::string& label) {
     }
     const std::size_t valueStart = text.find_first_not_of(" \t", start + label.size());
     return text.substr(valueStart, text.find('\n', valueStart) - valueStart);
-}
-
-void ignoreSignalHandled(int) {
-}
-
-void handle(int signalNumber, void (*handler)(int)) {
-    struct sigaction action = {};
-    action.sa_handler = handler; // and not SA_RESTART
-    sigaction(signalNumber, &action, nullptr);
-}
-
-/** Blocks all signals, and ignores or handles all but SIGCHLD, also those that glibc keeps to itself. */
-void changeAllSignals() {
-    const unsigned long ignored[8] = {1};
-    const std::size_t maskSize = _NSIG / 8;
-    for (int signalNumber = 1; signalNumber < _NSIG; ++signalNumber) {
-        if (signalNumber != SIGCHLD) {
-            syscall(SYS_rt_sigaction, signalNumber, ignored, nullptr, maskSize);
-        }
-    }
-    handle(SIGTERM, ignoreSignalHandled);
-    sigset_t all;
-    sigfillset(&all);
-    sigprocmask(SIG_BLOCK, &all, nullptr);
 }
 
 /** Opens descriptors that a program inherits if nobody keeps them from it. */
@@ -451,7 +428,7 @@ TEST_P(ARunProgram, IsNotStartedIfAnOutputFileCannotBeOpened) {
 TEST_P(ARunProgram, StartsWithDefaultSignalsAndNoneBlocked) {
     SubProcess process({"cat", "/proc/self/status"});
 
-    const std::string status = outputOf(process, changeAllSignals);
+    const std::string status = outputOf(process, support::changeAllSignals);
 
     EXPECT_EQ("0000000000000000", field(status, "SigBlk:"));
     EXPECT_EQ("0000000000000000", field(status, "SigIgn:"));
@@ -554,7 +531,7 @@ TEST(ACaller, WaitsForTheProgramWhateverSignalsArrive) {
 
     const int status = runInChild([&] {
         tickListener = open(fifo.c_str(), O_RDWR | O_CLOEXEC);
-        handle(SIGALRM, countTick);
+        support::handleSignal(SIGALRM, countTick);
         const itimerval everyMillisecond = {{0, 1000}, {0, 1000}};
         setitimer(ITIMER_REAL, &everyMillisecond, nullptr);
         const int result = SubProcess(shell("read line < " + fifo + "; exit 5")).call();
@@ -566,7 +543,7 @@ TEST(ACaller, WaitsForTheProgramWhateverSignalsArrive) {
 
 TEST(ACaller, IsToldIfItKeepsNoStatusOfItsChildren) {
     const int status = runInChild([] {
-        handle(SIGCHLD, SIG_IGN);
+        support::handleSignal(SIGCHLD, SIG_IGN);
         return SubProcess({"true"}).call() == -1 && errno == ECHILD ? 0 : 1;
     });
 
@@ -590,7 +567,7 @@ TEST(ACaller, KeepsItsSignalsItsDescriptorsAndItsEnvironment) {
         sigemptyset(&blocked);
         sigaddset(&blocked, SIGUSR1);
         sigprocmask(SIG_SETMASK, &blocked, nullptr);
-        handle(SIGPIPE, SIG_IGN);
+        support::handleSignal(SIGPIPE, SIG_IGN);
         openMoreDescriptors();
         setenv("NAME", "ours", 1);
         const std::string before = readFile("/proc/self/status");
@@ -656,7 +633,7 @@ TEST(AReplacedProcess, KeepsItsId) {
 TEST(AReplacedProcess, EndsBySignalsThatWereHeldBack) {
     const TempDir dir;
     const int status = runInChild([&] {
-        handle(SIGTERM, ignoreSignalHandled);
+        support::handleSignal(SIGTERM, [](int) {});
         sigset_t blocked;
         sigemptyset(&blocked);
         sigaddset(&blocked, SIGTERM);
