@@ -51,8 +51,10 @@ public:
 private:
     [[noreturn]] void watch() {
         while (true) {
-            const auto pause = std::chrono::duration_cast<std::chrono::nanoseconds>(look());
-            const timespec rest = {pause.count() / 1000000000, pause.count() % 1000000000};
+            const Clock::duration pause = look();
+            const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(pause);
+            const timespec rest = {static_cast<time_t>(seconds.count()),
+                                   static_cast<long>(std::chrono::nanoseconds(pause - seconds).count())};
             if (sigtimedwait(&signals, nullptr, &rest) == SIGINT) {
                 endWith(interrupted);
             }

@@ -173,9 +173,9 @@ TEST_F(DestroyExpired, DestroysANewSessionWithoutALifetime) {
 
 TEST_F(DestroyExpired, ReckonsWithTheLongestLifetimesAndTheOldestDirectories) {
     const std::int64_t longest = LONGEST;
-    const std::int64_t newest = std::numeric_limits<time_t>::max();
-    const std::int64_t oldest = std::numeric_limits<time_t>::min();
-    const auto left = [](std::int64_t stamp, long lifetime) { return leftAfter(stamp, lifetime, false); };
+    const time_t newest = std::numeric_limits<time_t>::max();
+    const time_t oldest = std::numeric_limits<time_t>::min();
+    const auto left = [](time_t stamp, long lifetime) { return leftAfter(stamp, lifetime, false); };
     EXPECT_EQ(longest - 10, withinOneSecond([&](time_t now) { return left(now - 10, LONGEST); }));
     EXPECT_EQ(longest, withinOneSecond([&](time_t now) { return left(now, LONGEST); }));
     EXPECT_EQ(longest, withinOneSecond([&](time_t now) { return left(now + 10, LONGEST); }));
