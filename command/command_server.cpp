@@ -421,7 +421,8 @@ bool CommandServer::run(const RequestHandler& handler, const std::string& socket
 
 bool CommandServer::setTimeout(const TimeoutHandler& callback, timeval delay, void* argument) {
     auto* const record = new TimeoutRecord{callback, argument};
-    event* const timer = event_new(d->eventBase, -1, 0, timeoutCallback, record);
+    // Before the loop runs there is no base. libevent refuses that itself only where it was not built for release.
+    event* const timer = d->eventBase != nullptr ? event_new(d->eventBase, -1, 0, timeoutCallback, record) : nullptr;
     if (timer != nullptr && event_add(timer, &delay) == 0) {
         return true;
     }
