@@ -43,6 +43,22 @@ TEST_F(Marubackupctl, AddPrintsTheIdAloneAndHandsTheParametersOver) {
     EXPECT_EQ(2U, job.getParam("list", Json::Value()).size());
 }
 
+TEST_F(Marubackupctl, AddTakesForJsonWhatTheDaemonDoes) {
+    start();
+    for (const char* json :
+         {R"("\ud83d\u0041")", R"("\ude00")", R"("\ud83d")", "01", "1.", "+1", "1 2", "[1,]", "//\n1", "{a:1}"}) {
+        const Outcome outcome = run({"add", "gated", "backup", "-p", std::string("x:=") + json});
+        EXPECT_EQ("exit 2", outcome.ended) << json;
+        EXPECT_NE(std::string::npos, outcome.err.find("the value of x is not JSON")) << outcome.err;
+    }
+    const Outcome outcome = run({"add", "gated", "backup", "--json", "-p", "gate=" + newGate().path(), "-p",
+                                 R"(whole:="\ud83d\ude00")", "-p", R"(twice:={"a":1,"a":2})"});
+    EXPECT_EQ("exit 0", outcome.ended) << outcome.err;
+    const Json::Value parameters = parse(outcome.out)["param"];
+    EXPECT_EQ("\xF0\x9F\x98\x80", parameters["whole"].asString());
+    EXPECT_EQ(2, parameters["twice"]["a"].asInt());
+}
+
 TEST_F(Marubackupctl, ListShowsWhatRunsAndWhatWaits) {
     start();
     addHeld(newGate());
