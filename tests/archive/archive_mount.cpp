@@ -1,11 +1,13 @@
 #include "archive_mount.h"
 
+#include <fcntl.h>
 #include <sys/mount.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <csignal>
 #include <sstream>
+#include <stdexcept>
 #include <system_error>
 
 #include "support/files.h"
@@ -23,16 +25,37 @@ std::string readLine(int fd) {
     return text;
 }
 
+/** Why the machine lets nobody here mount a file system in FUSE on `folder`; empty if it does. */
+std::string whyNotAllowed(const std::string& folder) {
+    const int device = open("/dev/fuse", O_RDWR | O_CLOEXEC);
+    if (device < 0) {
+        return "/dev/fuse: " + std::generic_category().message(errno);
+    }
+    // With nobody behind it yet: only whether it may be is asked.
+    const std::string options = "fd=" + std::to_string(device) + ",rootmode=40000,user_id=0,group_id=0";
+    const bool mounted = mount("fuse", folder.c_str(), "fuse", MS_NOSUID | MS_NODEV, options.c_str()) == 0;
+    const std::string reason = mounted ? "" : "mount: " + std::generic_category().message(errno);
+    close(device);
+    if (mounted) {
+        umount2(folder.c_str(), MNT_DETACH);
+    }
+    return reason;
+}
+
 } // namespace
 
 std::unique_ptr<ArchiveMount> ArchiveMount::make(std::string& reason) {
     std::unique_ptr<ArchiveMount> mount(new ArchiveMount);
-    const std::string said = mount->start();
-    if (said == "mounted") {
-        return mount;
+    const std::string refusal = whyNotAllowed(mount->path());
+    if (!refusal.empty()) {
+        reason = "no FUSE here: " + refusal;
+        return nullptr;
     }
-    reason = "no file system can be mounted here: " + said;
-    return nullptr;
+    const std::string said = mount->start();
+    if (said != "mounted") {
+        throw std::runtime_error("the file system does not come up: " + said);
+    }
+    return mount;
 }
 
 std::string ArchiveMount::start() {
@@ -55,8 +78,10 @@ std::string ArchiveMount::start() {
 ArchiveMount::~ArchiveMount() {
     umount2(path().c_str(), MNT_DETACH);
     // By itself it ends only when nobody has a file of it open any more.
-    kill(server, SIGKILL);
-    support::waitForChild(server);
+    if (server > 0) {
+        kill(server, SIGKILL);
+        support::waitForChild(server);
+    }
 }
 
 std::uint32_t ArchiveMount::version() const {

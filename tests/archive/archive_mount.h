@@ -14,7 +14,10 @@
  */
 class ArchiveMount {
 public:
-    /** None, with the reason in `reason`, where no such file system can be mounted. */
+    /**
+     * None, with the reason in `reason`, where the machine does not let one be
+     * mounted; where it does, a file system that does not come up is an exception.
+     */
     static std::unique_ptr<ArchiveMount> make(std::string& reason);
 
     ~ArchiveMount();
