@@ -58,6 +58,11 @@ protected:
         EXPECT_THAT(diary.take(), ElementsAre("failed to setTimeout for clean session job"));
     }
 
+    void expectRefused(const std::string& request) {
+        EXPECT_EQ(R"({"code":400})", ask(request)) << request;
+        EXPECT_THAT(diary.take(), ElementsAre("get bad sessin clean job request")) << request;
+    }
+
     support::SessionAreas areas;
     CommandServer server;
 };
@@ -67,11 +72,9 @@ protected:
 TEST_F(CleanSessionRequests, RefusesWhatNamesNoSession) {
     const std::string lifetime = R"("op":"clean_session","lifetime":0)";
     for (const std::string id : {"null", "true", "false", "[]", R"(["id"])", "{}", R"({"id":"id"})"}) {
-        EXPECT_EQ(R"({"code":400})", ask("{" + lifetime + R"(,"sess_id":)" + id + "}")) << id;
-        EXPECT_THAT(diary.take(), ElementsAre("get bad sessin clean job request"));
+        expectRefused("{" + lifetime + R"(,"sess_id":)" + id + "}");
     }
-    EXPECT_EQ(R"({"code":400})", ask("{" + lifetime + "}"));
-    EXPECT_THAT(diary.take(), ElementsAre("get bad sessin clean job request"));
+    expectRefused("{" + lifetime + "}");
     EXPECT_THAT(log.lines(), IsEmpty());
 }
 
@@ -90,11 +93,9 @@ TEST_F(CleanSessionRequests, RefusesALifetimeThatIsNoIntegerOf64Bits) {
                                      "18446744073709551616",
                                      "-9223372036854775809"};
     for (const std::string& lifetime : lifetimes) {
-        EXPECT_EQ(R"({"code":400})", ask("{" + id + R"(,"lifetime":)" + lifetime + "}")) << lifetime;
-        EXPECT_THAT(diary.take(), ElementsAre("get bad sessin clean job request"));
+        expectRefused("{" + id + R"(,"lifetime":)" + lifetime + "}");
     }
-    EXPECT_EQ(R"({"code":400})", ask("{" + id + "}"));
-    EXPECT_THAT(diary.take(), ElementsAre("get bad sessin clean job request"));
+    expectRefused("{" + id + "}");
     EXPECT_THAT(log.lines(), IsEmpty());
 }
 
