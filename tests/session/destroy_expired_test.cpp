@@ -1,6 +1,7 @@
 #include <marubackup/timed_session.h>
 
 #include <cstdint>
+#include <cstdlib>
 #include <filesystem>
 #include <limits>
 #include <string>
@@ -189,6 +190,18 @@ TEST_F(DestroyExpired, ReckonsWithTheLongestLifetimesAndTheOldestDirectories) {
                   EXPECT_EQ(newest - now - 5, left(newest, -5));
                   return 0;
               }));
+    expectErrors({});
+}
+
+TEST_F(DestroyExpired, ReckonsWithADirectoryWhoseTimeDoesNotFitIn32Bits) {
+    const Made session = makeSession();
+    ASSERT_EQ(0, std::system(("touch -d @4102444800 " + session.path).c_str()));
+
+    EXPECT_LT(0, TimedSession::destroyExpired(session.id, 0, true));
+    setTimes(session.path, 0, 0);
+    EXPECT_EQ(0, TimedSession::destroyExpired(session.id, 0, true));
+
+    expectDestroyed(session);
     expectErrors({});
 }
 

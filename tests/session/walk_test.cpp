@@ -7,8 +7,12 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <cstdint>
+#include <cstdlib>
 #include <filesystem>
+#include <limits>
 #include <string>
 #include <system_error>
 #include <vector>
@@ -135,6 +139,36 @@ TEST_F(SessionWalk, CountsTheLatestReadingOfAllFilesAtAnyDepth) {
 
     EXPECT_LE(left, LONG_TIME - 10);
     EXPECT_GT(left, LONG_TIME - 20);
+}
+
+TEST_F(SessionWalk, CountsTheReadingOfAFileOver2GiB) {
+    const std::string file = addFile(session.path + "/file", 0);
+    fs::resize_file(file, 5ULL << 30);
+
+    EXPECT_EQ(LONG_TIME - 10, withinOneSecond([&](time_t now) {
+                  setTimes(file, now - 10, 0);
+                  forgetUse();
+                  return TimedSession::destroyExpired(session.id, LONG_TIME, true);
+              }));
+    setTimes(file, 0, 0);
+    EXPECT_TRUE(isExpired());
+    expectDestroyed(session);
+    expectErrors({});
+}
+
+TEST_F(SessionWalk, CountsAReadingThatDoesNotFitIn32Bits) {
+    const std::int64_t in2100 = 4102444800;
+    addFile(session.path + "/file", 0);
+    // By a program, since a time may have 32 bits here.
+    ASSERT_EQ(0, std::system(("touch -a -d @4102444800 " + session.path + "/file").c_str()));
+    forgetUse();
+
+    const std::int64_t left = TimedSession::destroyExpired(session.id, 0, true);
+
+    const std::int64_t longest = std::numeric_limits<long>::max();
+    EXPECT_LE(left, std::min(in2100 - time(nullptr) + 10, longest));
+    EXPECT_GE(left, std::min(in2100 - time(nullptr) - 10, longest));
+    expectErrors({});
 }
 
 TEST_F(SessionWalk, CountsAReadingInTheFuture) {

@@ -4,6 +4,7 @@
 
 #include <chrono>
 #include <csignal>
+#include <cstdint>
 #include <filesystem>
 #include <limits>
 #include <memory>
@@ -130,18 +131,23 @@ TEST_F(SessionCleanUp, RemovesASessionWhoseCreatorHasEnded) {
     EXPECT_EQ(0, log.count("failed to"));
 }
 
-TEST_F(SessionCleanUp, WaitsALifetimeFromTheLastReadingOfAFile) {
-    const Made session = makeSession();
-    const std::string file = session.path + "/file";
-    support::writeFile(file, "content");
-    const time_t lastReading = time(nullptr) + 2;
-    setTimes(file, lastReading, 0);
-    setTimes(session.path, 0, 0);
+TEST_F(SessionCleanUp, WaitsALifetimeFromTheLastReadingOfAFileOfAnySize) {
+    const std::uintmax_t sizes[] = {1, 5ULL << 30}; // the second does not fit 32 bits
+    for (const std::uintmax_t size : sizes) {
+        const Made session = makeSession();
+        const std::string file = session.path + "/file";
+        support::writeFile(file, "");
+        fs::resize_file(file, size);
+        const time_t lastReading = time(nullptr) + 2;
+        setTimes(file, lastReading, 0);
+        setTimes(session.path, 0, 0);
 
-    askToCleanUp(session, "1");
+        askToCleanUp(session, "1");
 
-    expectCleanedUp(session);
-    EXPECT_GE(time(nullptr), lastReading + 1);
+        expectCleanedUp(session);
+        EXPECT_GE(time(nullptr), lastReading + 1);
+    }
+    EXPECT_EQ(0, log.count("failed to"));
 }
 
 TEST_F(SessionCleanUp, WaitsALifetimeFromWhatAnApplicationReallyReads) {
