@@ -6,10 +6,14 @@
 
 #include <cerrno>
 #include <csignal>
+#include <cstdlib>
+#include <filesystem>
 #include <sstream>
 #include <stdexcept>
 #include <system_error>
 
+#include "archive_version.h"
+#include "support/emulation.h"
 #include "support/files.h"
 #include "support/in_child.h"
 
@@ -44,8 +48,19 @@ std::string whyNotAllowed(const std::string& folder) {
 
 } // namespace
 
+void passRequestsOn() {
+    if (support::isEmulated()) {
+        setenv("LD_PRELOAD", ARCHIVE_VERSION_SERVED_BY, 1);
+    }
+}
+
 std::unique_ptr<ArchiveMount> ArchiveMount::make(std::string& reason) {
     std::unique_ptr<ArchiveMount> mount(new ArchiveMount);
+    if (support::isEmulated()) {
+        passRequestsOn();
+        mount->makeFolder();
+        return mount;
+    }
     const std::string refusal = whyNotAllowed(mount->path());
     if (!refusal.empty()) {
         reason = "no FUSE here: " + refusal;
@@ -66,7 +81,7 @@ std::string ArchiveMount::start() {
     server = support::startInChild([&]() {
         dup2(ends[1], STDOUT_FILENO);
         dup2(ends[1], STDERR_FILENO);
-        execl(ARCHIVE_VERSION_FS, ARCHIVE_VERSION_FS, "-f", "-s", path().c_str(), nullptr);
+        execl(ARCHIVE_VERSION_SERVED_BY, ARCHIVE_VERSION_SERVED_BY, "-f", "-s", path().c_str(), nullptr);
         return 126;
     });
     close(ends[1]);
@@ -75,23 +90,35 @@ std::string ArchiveMount::start() {
     return said;
 }
 
+void ArchiveMount::makeFolder() const {
+    support::writeFile(path("control"), ArchiveVersion().settings());
+    support::writeFile(path("file"), "");
+    std::filesystem::create_directory(path("folder"));
+}
+
 ArchiveMount::~ArchiveMount() {
+    if (server < 0) {
+        return;
+    }
     umount2(path().c_str(), MNT_DETACH);
     // By itself it ends only when nobody has a file of it open any more.
-    if (server > 0) {
-        kill(server, SIGKILL);
-        support::waitForChild(server);
-    }
+    kill(server, SIGKILL);
+    support::waitForChild(server);
 }
 
 std::uint32_t ArchiveMount::version() const {
     std::istringstream settings(support::readFile(path("control")));
-    std::string name;
     std::uint32_t version = 0;
-    settings >> name >> version;
+    std::int64_t number = 0;
+    for (std::string name; settings >> name >> number;) {
+        version = name == "version" ? static_cast<std::uint32_t>(number) : version;
+    }
     return version;
 }
 
 void ArchiveMount::set(const std::string& name, std::int64_t number) const {
-    support::writeFile(path("control"), name + " " + std::to_string(number));
+    const std::string line = name + " " + std::to_string(number) + "\n";
+    // Of lines for one thing the last counts.
+    const std::string earlier = server < 0 ? support::readFile(path("control")) : "";
+    support::writeFile(path("control"), earlier + line);
 }

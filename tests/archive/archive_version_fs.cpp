@@ -20,79 +20,19 @@
 #include <sys/stat.h>
 
 #include <cerrno>
-#include <cstdint>
 #include <cstdio>
-#include <cstring>
-#include <optional>
-#include <sstream>
 #include <string>
 
-namespace {
+#include "archive_version.h"
 
-const unsigned GET = 0xC0047879;
-const unsigned INCREASE = 0x2000787B;
+namespace {
 
 const std::string ROOT = "/";
 const std::string FOLDER = "/folder";
 const std::string EMPTY_FILE = "/file";
 const std::string CONTROL = "/control";
 
-std::uint32_t version = 0;
-int increaseResult = 0;
-int getResult = 0;
-std::optional<int> getResultAfterIncrease;
-
-std::string settings() {
-    std::ostringstream text;
-    text << "version " << version << "\nincrease " << increaseResult << "\nget " << getResult << "\nget_after_increase "
-         << getResultAfterIncrease.value_or(getResult) << '\n';
-    return text.str();
-}
-
-bool set(const std::string& line) {
-    std::istringstream words(line);
-    std::string name;
-    std::int64_t number = 0;
-    if (!(words >> name >> number)) {
-        return false;
-    }
-    if (name == "version") {
-        version = static_cast<std::uint32_t>(number);
-    } else if (name == "increase") {
-        increaseResult = static_cast<int>(number);
-    } else if (name == "get") {
-        getResult = static_cast<int>(number);
-    } else if (name == "get_after_increase") {
-        getResultAfterIncrease = static_cast<int>(number);
-    } else {
-        return false;
-    }
-    return true;
-}
-
-int increase() {
-    if (increaseResult < 0) {
-        return increaseResult;
-    }
-    ++version;
-    getResult = getResultAfterIncrease.value_or(getResult);
-    return increaseResult;
-}
-
-/** The caller hands in a zero. */
-int get(void* data) {
-    std::uint32_t value = 1;
-    if (data != nullptr) {
-        std::memcpy(&value, data, sizeof value);
-    }
-    if (value != 0) {
-        return -EINVAL;
-    }
-    if (getResult >= 0) {
-        std::memcpy(data, &version, sizeof version);
-    }
-    return getResult;
-}
+ArchiveVersion archive;
 
 /** Says to whoever has started this that the requests are answered from now on. */
 void* begin(fuse_conn_info*, fuse_config*) {
@@ -102,14 +42,7 @@ void* begin(fuse_conn_info*, fuse_config*) {
 }
 
 int answerRequest(const char*, unsigned request, void*, fuse_file_info*, unsigned, void* data) {
-    switch (request) {
-    case GET:
-        return get(data);
-    case INCREASE:
-        return increase();
-    default:
-        return -ENOTTY;
-    }
+    return archive.answer(request, data);
 }
 
 int giveAttributes(const char* path, struct stat* record, fuse_file_info*) {
@@ -144,7 +77,7 @@ int truncateFile(const char*, off_t, fuse_file_info*) {
 }
 
 int readFile(const char* path, char* bytes, std::size_t size, off_t offset, fuse_file_info*) {
-    const std::string text = path == CONTROL ? settings() : std::string();
+    const std::string text = path == CONTROL ? archive.settings() : std::string();
     const auto from = static_cast<std::size_t>(offset);
     return from < text.size() ? static_cast<int>(text.copy(bytes, size, from)) : 0;
 }
@@ -153,7 +86,7 @@ int writeFile(const char* path, const char* bytes, std::size_t size, off_t, fuse
     if (path != CONTROL) {
         return -EACCES;
     }
-    return set(std::string(bytes, size)) ? static_cast<int>(size) : -EINVAL;
+    return archive.set(std::string(bytes, size)) ? static_cast<int>(size) : -EINVAL;
 }
 
 } // namespace

@@ -6,6 +6,7 @@
 #include <sstream>
 #include <string>
 
+#include "support/emulation.h"
 #include "support/files.h"
 #include "support/waiting.h"
 
@@ -15,6 +16,27 @@ namespace {
 char stateOf(pid_t pid) {
     const std::string stat = support::readFile("/proc/" + std::to_string(pid) + "/stat");
     return stat.at(stat.rfind(')') + 2);
+}
+
+/**
+ * Our number of a system call that the kernel shows as `number`. An emulated
+ * program's calls are made by the emulator, and have the host's numbers: those of
+ * x86-64, of the calls that tests wait for.
+ */
+long ownNumber(long number) {
+    if (!support::isEmulated()) {
+        return number;
+    }
+    switch (number) {
+    case 44:
+        return SYS_sendto;
+    case 45:
+        return SYS_recvfrom;
+    case 281:
+        return SYS_epoll_pwait;
+    default:
+        return -1;
+    }
 }
 
 } // namespace
@@ -31,6 +53,7 @@ BlockedCall blockedCall(pid_t pid) {
     if (!(fields >> call.number >> descriptor >> buffer >> size)) {
         return BlockedCall();
     }
+    call.number = ownNumber(call.number);
     call.size = std::stoul(size, nullptr, 16);
     return call;
 }

@@ -18,6 +18,7 @@
 
 #include <marucore/error.h>
 
+#include "support/emulation.h"
 #include "support/files.h"
 #include "support/in_child.h"
 #include "support/signals.h"
@@ -84,6 +85,7 @@ TEST_F(AnExecutedProgram, MayHaveNoArgumentsAndKnowsItsPath) {
 }
 
 TEST_F(AnExecutedProgram, MustBeOneThatCanBeRun) {
+    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     support::writeFile(dir.path("plain"), "#!/bin/sh\nexit 0\n", 0644);
     support::writeFile(dir.path("no_program"), "exit 0\n", 0755);
     support::writeFile(dir.path("no_interpreter"), "#!/nowhere\n", 0755);
@@ -95,6 +97,7 @@ TEST_F(AnExecutedProgram, MustBeOneThatCanBeRun) {
 }
 
 TEST_F(AnExecutedProgram, IsNotLookedForInPath) {
+    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     const int status = runInChild([this] {
         const bool moved = chdir(dir.path().c_str()) == 0;
         setenv("PATH", "/usr/bin:/bin", 1);
@@ -195,6 +198,7 @@ TEST_F(AnExecutedProgram, IsNoLongerAChildAfterwards) {
 }
 
 TEST_F(AnExecutedProgram, AnswersTheThreadThatAsked) {
+    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     std::vector<std::thread> threads;
     for (int number = 0; number < 8; ++number) {
         threads.emplace_back([number] {

@@ -15,6 +15,7 @@
 
 #include <gtest/gtest.h>
 
+#include "support/emulation.h"
 #include "support/files.h"
 #include "support/in_child.h"
 #include "support/signals.h"
@@ -165,12 +166,18 @@ TEST_P(ARunProgram, IsCalledAsTheCallerNamedIt) {
 }
 
 TEST_P(ARunProgram, MustBeThere) {
+    if (GetParam() == Way::CALL) {
+        SKIP_IF_EMULATED(support::SPAWN_ERRORS);
+    }
     EXPECT_EQ("failed: No such file or directory", outcome(SubProcess({dir.path("missing")})));
     EXPECT_EQ("failed: No such file or directory", outcome(SubProcess({"marubackup-test-no-such-program"})));
     EXPECT_EQ("failed: Not a directory", outcome(SubProcess({"/dev/null/program"})));
 }
 
 TEST_P(ARunProgram, MustBeAnExecutableFile) {
+    if (GetParam() == Way::CALL) {
+        SKIP_IF_EMULATED(support::SPAWN_ERRORS);
+    }
     const std::string plain = dir.path("plain");
     writeFile(plain, "#!/bin/sh\n", 0644);
 
@@ -185,6 +192,9 @@ TEST_P(ARunProgram, MayBeAScriptThatNamesItsInterpreter) {
 }
 
 TEST_P(ARunProgram, IsNotHandedToAShellIfItIsNoProgram) {
+    if (GetParam() == Way::CALL) {
+        SKIP_IF_EMULATED(support::SPAWN_ERRORS);
+    }
     writeFile(dir.path("script"), "exit 0\n", 0755);
     const auto searchThere = [this] { setenv("PATH", dir.path().c_str(), 1); };
 
@@ -193,6 +203,9 @@ TEST_P(ARunProgram, IsNotHandedToAShellIfItIsNoProgram) {
 }
 
 TEST_P(ARunProgram, IsRefusedIfItsArgumentsAreTooLong) {
+    if (GetParam() == Way::CALL) {
+        SKIP_IF_EMULATED(support::SPAWN_ERRORS);
+    }
     EXPECT_EQ("failed: Argument list too long", outcome(SubProcess({"true", std::string(16 * 1024 * 1024, 'x')})));
 }
 
@@ -225,6 +238,9 @@ TEST_P(ARunProgram, IsRefusedIfATextCannotReachTheKernelWhole) {
 }
 
 TEST_P(ARunProgram, IsReportedOnOneLineIfItDoesNotRun) {
+    if (GetParam() == Way::CALL) {
+        SKIP_IF_EMULATED(support::SPAWN_ERRORS);
+    }
     const auto reportOf = [this](SubProcess& process) {
         const std::string report = dir.path("report");
         writeFile(report, "");
@@ -405,6 +421,9 @@ TEST_P(ARunProgram, WritesBothStreamsToOneFileInOrder) {
 }
 
 TEST_P(ARunProgram, IsNotStartedIfAnOutputFileCannotBeOpened) {
+    if (GetParam() == Way::CALL) {
+        SKIP_IF_EMULATED(support::SPAWN_ERRORS);
+    }
     const std::string ran = dir.path("ran");
     const std::vector<std::pair<std::string, std::string>> outcomes = {
         {dir.path("missing/file"), "failed: No such file or directory"},
@@ -448,6 +467,7 @@ TEST_P(ARunProgram, HasNoDescriptorButTheStandardOnes) {
 
 // close_range() came with Linux 5.9, and its close-on-exec flag with 5.11.
 TEST_P(ARunProgram, HasNoOtherDescriptorAlsoOnAnOldKernel) {
+    SKIP_IF_EMULATED(support::REFUSED_CALLS);
     for (const int answer : {ENOSYS, EINVAL}) {
         SubProcess process({"ls", "/proc/self/fd"});
         const auto runOnOldKernel = [=] {
@@ -589,6 +609,7 @@ TEST(ACaller, KeepsItsSignalsItsDescriptorsAndItsEnvironment) {
 }
 
 TEST(ACaller, LeavesNoChildAndNoDescriptorBehind) {
+    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     const TempDir dir;
     const int status = runInChild([&] {
         const int before = dup(STDOUT_FILENO);

@@ -14,6 +14,7 @@
 #include <gtest/gtest.h>
 
 #include "signals.h"
+#include "support/emulation.h"
 #include "support/files.h"
 #include "support/in_child.h"
 #include "support/syscall_filter.h"
@@ -77,6 +78,7 @@ void reportSignal(int) {
 } // namespace
 
 TEST(ForkWithDefaultSignals, LeavesNothingOfTheDaemonsSetUpInTheChild) {
+    SKIP_IF_EMULATED("the process's own signals are the emulator's");
     const support::TempDir folder;
 
     const int status = runInChild([&]() {
@@ -109,6 +111,7 @@ TEST(ForkWithDefaultSignals, LeavesTheDaemonsSetUpAlone) {
 }
 
 TEST(ForkWithDefaultSignals, SaysWhyThereIsNoChildAndUnblocksSignalsAgain) {
+    SKIP_IF_EMULATED(support::REFUSED_CALLS);
     const int status = runInChild([]() {
         const std::string before = signalSetUp();
         support::refuseSystemCalls({SYS_clone, SYS_clone3}, EAGAIN);

@@ -14,6 +14,7 @@
 #include "queue_fixture.h"
 #include "signals.h"
 #include "support/backend_files.h"
+#include "support/emulation.h"
 #include "support/in_child.h"
 #include "support/named_rows.h"
 #include "support/syscall_filter.h"
@@ -124,6 +125,7 @@ TEST_F(Launch, OfABackendWithoutTheActionStartsNothing) {
 }
 
 TEST_F(Launch, WithoutRoomForAProcessSaysWhy) {
+    SKIP_IF_EMULATED(support::REFUSED_CALLS);
     Job& job = addHeld(Job::ACTION_BACKUP);
     const std::string queued = job.toString();
 
@@ -138,6 +140,7 @@ TEST_F(Launch, WithoutRoomForAProcessSaysWhy) {
 }
 
 TEST_F(Launch, WithoutRoomForAProcessDropsTheJob) {
+    SKIP_IF_EMULATED(support::REFUSED_CALLS);
     Job& job = addHeld(Job::ACTION_BACKUP);
     const std::string queued = job.toString();
 

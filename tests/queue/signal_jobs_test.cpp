@@ -11,6 +11,7 @@
 #include <gtest/gtest.h>
 
 #include "queue_fixture.h"
+#include "support/emulation.h"
 #include "support/in_child.h"
 #include "support/nobody.h"
 #include "support/syscall_filter.h"
@@ -125,6 +126,7 @@ TEST_F(SignalToAJob, ThatMayNotBeSentIsReportedAndCountsAsSent) {
 }
 
 TEST_F(SignalToAJob, ThatTheKernelRefusesIsReportedForEachSignal) {
+    SKIP_IF_EMULATED(support::REFUSED_CALLS);
     Job& job = addWithProcess(getpid(), Job::STATUS_RUNNING);
 
     const pid_t daemon = support::startInChild([&]() {

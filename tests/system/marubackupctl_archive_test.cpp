@@ -14,6 +14,10 @@ namespace {
 
 class MarubackupctlArchiveVersion : public ToolTest {
 protected:
+    MarubackupctlArchiveVersion() {
+        passRequestsOn();
+    }
+
     Outcome archiveVersion(const std::string& verb, const std::string& path, const Arguments& more = {}) {
         Arguments arguments = {"archive-version", verb, path};
         arguments.insert(arguments.end(), more.begin(), more.end());

@@ -15,6 +15,7 @@
 #include "daemon_test.h"
 #include "raw_requests.h"
 #include "support/backend_files.h"
+#include "support/emulation.h"
 #include "support/files.h"
 #include "support/in_child.h"
 #include "support/named_rows.h"
@@ -455,6 +456,7 @@ TEST_F(Misbehaving, AJobWhoseOutputNobodyReadsDiesOfItAlone) {
 }
 
 TEST_F(Misbehaving, AJobThatCannotBeReapedKeepsItsSlotInSilence) {
+    SKIP_IF_EMULATED(support::REFUSED_CALLS);
     support::DaemonOptions options;
     options.beforeStart = []() { support::refuseSystemCalls({SYS_wait4, SYS_waitid}, EPERM); };
     start(options);
@@ -474,6 +476,7 @@ TEST_F(Misbehaving, AJobThatCannotBeReapedKeepsItsSlotInSilence) {
 }
 
 TEST_F(Misbehaving, AJobThatWasReapedBehindTheDaemonsBackIsReportedAtEveryLook) {
+    SKIP_IF_EMULATED(support::REFUSED_CALLS);
     support::DaemonOptions options;
     options.beforeStart = []() {
         // With SIGCHLD ignored the kernel reaps children itself. The daemon is

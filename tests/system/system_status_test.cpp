@@ -14,6 +14,7 @@
 #include "daemon_test.h"
 #include "support/appliance.h"
 #include "support/backend_files.h"
+#include "support/emulation.h"
 #include "support/in_child.h"
 #include "support/waiting.h"
 
@@ -232,6 +233,7 @@ TEST_F(SystemStatus, ASnapshotRestoreHoldsBackEverythingAndIsNamedBeforeABackup)
 }
 
 TEST_F(SystemStatus, AToolThatCannotBeRunIsToldToTheLogWithoutTheProcess) {
+    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     std::filesystem::remove(support::SNAPSHOT_TOOL);
 
     EXPECT_EQ(UNTOUCHED, reasonOf(System::canBackup));

@@ -8,6 +8,7 @@
 
 #include "status_fixture.h"
 #include "support/appliance.h"
+#include "support/emulation.h"
 #include "support/in_child.h"
 
 // The tool that knows whether a snapshot of a shared folder is being restored.
@@ -54,6 +55,7 @@ TEST_F(SnapshotTool, HoldsABackupBackByOneAlone) {
 }
 
 TEST_F(SnapshotTool, MayBeMissing) {
+    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     std::filesystem::remove(support::SNAPSHOT_TOOL);
     expectComplaint(CANNOT_BE_RUN);
 
@@ -62,6 +64,7 @@ TEST_F(SnapshotTool, MayBeMissing) {
 }
 
 TEST_F(SnapshotTool, MayBeNoProgram) {
+    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     ASSERT_EQ(0, chmod(support::SNAPSHOT_TOOL, 0644));
     expectComplaint(CANNOT_BE_RUN);
 
@@ -82,6 +85,7 @@ TEST_F(SnapshotTool, MayBeEndedByASignal) {
 }
 
 TEST_F(SnapshotTool, IsComplainedOfOnceAPredicate) {
+    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     std::filesystem::remove(support::SNAPSHOT_TOOL);
 
     EXPECT_EQ(ALLOWED, ask(System::canRestore));

@@ -6,6 +6,7 @@
 
 #include "status_fixture.h"
 #include "support/appliance.h"
+#include "support/emulation.h"
 #include "support/fake_daemon.h"
 
 using namespace MARU::Backup;
@@ -60,6 +61,7 @@ TEST_F(SeveralThreads, AskTheDaemonSideBySide) {
 }
 
 TEST_F(SeveralThreads, ComplainEachOfTheirOwnFailure) {
+    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     std::filesystem::remove(support::SNAPSHOT_TOOL);
 
     inThreads([] { EXPECT_TRUE(System::canBackup()); });
