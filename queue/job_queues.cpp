@@ -1,33 +1,50 @@
 #include "queue/job_queues.h"
 
 #include <algorithm>
-#include <utility>
+#include <cstddef>
+#include <iterator>
 
 namespace MARU {
 namespace Backup {
 
-std::map<std::string, std::list<Job>> jobQueues;
+std::map<std::string, JobQueue> jobQueues;
 int nextJobId = 1;
 
 namespace {
 
-/** Stores true behind `arg` when it meets a job with the unique string. */
-class _JobCbIsTheSameUnique {
-public:
-    explicit _JobCbIsTheSameUnique(std::string wanted) : unique(std::move(wanted)) {
-    }
+/** Lets the callback have a job, and erases it if asked to. `job` is then the next one. */
+QueueIterControl visit(const std::string& queueName, JobQueue& jobs, JobQueue::const_iterator& job,
+                       const QueueIterCallback& callback, void* arg) {
+    QueueIterControl control = QUEUE_ITER_CONTINUE;
+    bool removeJob = false;
+    jobs.change(job, [&](Job& visited) { control = callback(queueName, visited, removeJob, arg); });
+    job = removeJob ? jobs.erase(job) : std::next(job);
+    return control;
+}
 
-    QueueIterControl operator()(const std::string&, Job& job, bool&, void* arg) const {
-        if (job.getUniqueString() != unique) {
-            return QUEUE_ITER_CONTINUE;
+enum Visited { ALL_JOBS, NOT_WAITING };
+
+bool foreachJob(Visited which, const QueueIterCallback& callback, void* arg) {
+    for (auto& entry : jobQueues) {
+        JobQueue& jobs = entry.second;
+        std::size_t left = which == ALL_JOBS ? jobs.size() : jobs.countNotWaiting();
+        for (auto job = jobs.begin(); left > 0;) {
+            if (which == NOT_WAITING && JobQueue::isWaiting(*job)) {
+                ++job;
+                continue;
+            }
+            --left;
+            const QueueIterControl control = visit(entry.first, jobs, job, callback, arg);
+            if (control == QUEUE_ITER_STOP) {
+                return true;
+            }
+            if (control == QUEUE_ITER_NEXT_QUEUE) {
+                break;
+            }
         }
-        *static_cast<bool*>(arg) = true;
-        return QUEUE_ITER_STOP;
     }
-
-private:
-    std::string unique;
-};
+    return true;
+}
 
 } // namespace
 
@@ -40,21 +57,31 @@ int queue_take_job_id() {
 }
 
 bool queue_foreach_job(const QueueIterCallback& callback, void* arg) {
+    return foreachJob(ALL_JOBS, callback, arg);
+}
+
+bool queue_foreach_job_not_waiting(const QueueIterCallback& callback, void* arg) {
+    return foreachJob(NOT_WAITING, callback, arg);
+}
+
+bool queue_visit_job(int id, const QueueIterCallback& callback, void* arg) {
     for (auto& entry : jobQueues) {
-        std::list<Job>& jobs = entry.second;
-        for (auto job = jobs.begin(); job != jobs.end();) {
-            bool removeJob = false;
-            const QueueIterControl control = callback(entry.first, *job, removeJob, arg);
-            job = removeJob ? jobs.erase(job) : std::next(job);
-            if (control == QUEUE_ITER_STOP) {
-                return true;
-            }
-            if (control == QUEUE_ITER_NEXT_QUEUE) {
-                break;
-            }
+        if (const Job* const job = entry.second.withId(id)) {
+            auto place = entry.second.placeOf(*job);
+            visit(entry.first, entry.second, place, callback, arg);
+            return true;
         }
     }
-    return true;
+    return false;
+}
+
+const Job* queue_find_job(int id) {
+    for (const auto& entry : jobQueues) {
+        if (const Job* const job = entry.second.withId(id)) {
+            return job;
+        }
+    }
+    return nullptr;
 }
 
 bool queue_is_empty(const std::string& queueName) {
@@ -67,9 +94,9 @@ bool queue_is_all_empty() {
 }
 
 bool queue_is_same_unique(const Job& job) {
-    bool found = false;
-    queue_foreach_job(_JobCbIsTheSameUnique(job.getUniqueString()), &found);
-    return found;
+    const std::string unique = job.getUniqueString();
+    return std::any_of(jobQueues.begin(), jobQueues.end(),
+                       [&unique](const auto& entry) { return entry.second.hasUnique(unique); });
 }
 
 } // namespace Backup

@@ -1,12 +1,13 @@
 #pragma once
 
-#include <list>
 #include <map>
 #include <string>
 
 #include <boost/function.hpp>
 
 #include <marubackup/job.h>
+
+#include "queue/job_queue.h"
 
 namespace MARU {
 namespace Backup {
@@ -18,7 +19,7 @@ namespace Backup {
  * The queues by name, which is action2str() of their jobs. A queue holds its
  * jobs in the order of their arrival; once there it stays, also when empty.
  */
-extern std::map<std::string, std::list<Job>> jobQueues;
+extern std::map<std::string, JobQueue> jobQueues;
 
 /** The id of the next job. Ids begin at 1 with each start of the daemon. */
 extern int nextJobId;
@@ -44,6 +45,21 @@ using QueueIterCallback =
  * Always true. The callback must not add or remove jobs by itself.
  */
 bool queue_foreach_job(const QueueIterCallback& callback, void* arg);
+
+/**
+ * The same for those jobs whose status is another than queued, without a look
+ * at the jobs that wait.
+ */
+bool queue_foreach_job_not_waiting(const QueueIterCallback& callback, void* arg);
+
+/**
+ * The same for one job: the first that has this id. False if there is none.
+ * What the callback answers does not matter.
+ */
+bool queue_visit_job(int id, const QueueIterCallback& callback, void* arg);
+
+/** The first job, in the order of queue_foreach_job(), that has this id; null if there is none. */
+const Job* queue_find_job(int id);
 
 /** Whether no job is in that queue; also if there is no such queue. */
 bool queue_is_empty(const std::string& queueName);

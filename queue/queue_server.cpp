@@ -104,13 +104,15 @@ namespace {
  * Whether the job has a process, now or already. A stopping one counts: it
  * holds its slot, and whatever it has locked, until its process has ended.
  */
-bool hasOrGetsProcess(Job& job) {
-    switch (job.getStatus()) {
+bool hasOrGetsProcess(JobQueue& jobs, JobQueue::const_iterator job) {
+    bool launched = false;
+    switch (job->getStatus()) {
     case Job::STATUS_RUNNING:
     case Job::STATUS_STOPPING:
         return true;
     case Job::STATUS_QUEUED:
-        return do_launch_job(job);
+        jobs.change(job, [&launched](Job& queued) { launched = do_launch_job(queued); });
+        return launched;
     default:
         return false;
     }
@@ -123,10 +125,10 @@ bool queue_launch_next_job(const std::string& queueName, bool& busy, int limit) 
     if (entry == jobQueues.end()) {
         return true;
     }
-    std::list<Job>& jobs = entry->second;
+    JobQueue& jobs = entry->second;
     int count = 0;
     for (auto job = jobs.begin(); job != jobs.end() && count < limit;) {
-        if (hasOrGetsProcess(*job)) {
+        if (hasOrGetsProcess(jobs, job)) {
             ++count;
             ++job;
         } else {
@@ -225,7 +227,8 @@ QueueIterControl checkChildCb(const std::string&, Job& job, bool& removeJob, voi
 
 bool queue_check_children_status(const char* tag) {
     queueLog(LOG_DEBUG, "[%s] check children status", tag != nullptr ? tag : "");
-    return queue_foreach_job(checkChildCb, nullptr);
+    // All that it does to a waiting job is to leave it alone.
+    return queue_foreach_job_not_waiting(checkChildCb, nullptr);
 }
 
 bool queue_kill_all_job() {

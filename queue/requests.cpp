@@ -96,18 +96,6 @@ void handleJobEnqueue(const Json::Value& request, Json::Value& reply, CommandSer
 
 // job_get
 
-QueueIterControl getJobCb(const std::string&, Job& job, bool&, void* arg) {
-    Job& wanted = *static_cast<Job*>(arg);
-    if (wanted.getJobId() < 0) {
-        return QUEUE_ITER_STOP;
-    }
-    if (job.getJobId() != wanted.getJobId()) {
-        return QUEUE_ITER_CONTINUE;
-    }
-    wanted = job;
-    return QUEUE_ITER_STOP;
-}
-
 void handleJobGet(const Json::Value& request, Json::Value& reply, CommandServer*) {
     const int id = requestedJobId(request);
     if (id == 0) {
@@ -115,40 +103,23 @@ void handleJobGet(const Json::Value& request, Json::Value& reply, CommandServer*
         queueLog(LOG_ERR, "bad job get request");
         return;
     }
-    Job job;
-    job.setJobId(id);
-    queue_foreach_job(getJobCb, &job);
-    if (job.getStatus() == Job::STATUS_NONE) {
+    const Job* const job = queue_find_job(id);
+    if (job == nullptr || job->getStatus() == Job::STATUS_NONE) {
         return refuse(reply, CODE_NOT_FOUND);
     }
-    reply[Member::JOB] = job.toJson();
+    reply[Member::JOB] = job->toJson();
 }
 
 // job_remove
 
-/** `arg` points at the id of the job to remove, and is set to 0 when it is found. */
-QueueIterControl removeJobCb(const std::string& queueName, Job& job, bool& removeJob, void* arg) {
-    int& id = *static_cast<int*>(arg);
-    if (id < 0) {
-        return QUEUE_ITER_STOP;
-    }
-    if (job.getJobId() != id) {
-        return QUEUE_ITER_CONTINUE;
-    }
-    sendSignalCb(queueName, job, removeJob, nullptr);
-    id = 0;
-    return QUEUE_ITER_STOP;
-}
-
 void handleJobRemove(const Json::Value& request, Json::Value& reply, CommandServer*) {
-    int id = requestedJobId(request);
+    const int id = requestedJobId(request);
     if (id == 0) {
         queueLog(LOG_ERR, "bad job remove request");
         return refuse(reply, CODE_BAD_REQUEST);
     }
     queueLog(LOG_INFO, "remove job [%d]", id);
-    queue_foreach_job(removeJobCb, &id);
-    if (id != 0) {
+    if (!queue_visit_job(id, sendSignalCb, nullptr)) {
         refuse(reply, CODE_NOT_FOUND);
     }
 }
@@ -164,8 +135,7 @@ struct ListFilter {
     std::string target;
 
     bool takes(const Job& job) const {
-        return (unique.empty() || unique == job.getUniqueString()) &&
-               (backend.empty() || backend == job.getBackend()) &&
+        return (backend.empty() || backend == job.getBackend()) &&
                (format.empty() || target.empty() || job.toFormatString(format) == target);
     }
 };
@@ -223,6 +193,25 @@ const char* readFilter(const Json::Value& request, ListFilter& filter) {
     return nullptr;
 }
 
+void listAll(const JobQueue& queue, const ListFilter& filter, Json::Value& jobs) {
+    for (const Job& job : queue) {
+        if (filter.takes(job)) {
+            jobs.append(job.toJson());
+        }
+    }
+}
+
+/** A list by unique string ends at the first job that passes. Whether there was one. */
+bool listFirst(const JobQueue& queue, const ListFilter& filter, Json::Value& jobs) {
+    for (const Job* const job : queue.withUnique(filter.unique)) {
+        if (filter.takes(*job)) {
+            jobs.append(job->toJson());
+            return true;
+        }
+    }
+    return false;
+}
+
 void handleJobList(const Json::Value& request, Json::Value& reply, CommandServer*) {
     ListFilter filter;
     if (const char* bad = readFilter(request, filter)) {
@@ -231,14 +220,11 @@ void handleJobList(const Json::Value& request, Json::Value& reply, CommandServer
     }
     Json::Value& jobs = reply[Member::JOBS] = Json::Value(Json::arrayValue);
     for (const std::string& name : filter.queueNames) {
-        for (const Job& job : jobQueues[name]) {
-            if (!filter.takes(job)) {
-                continue;
-            }
-            jobs.append(job.toJson());
-            if (!filter.unique.empty()) {
-                return;
-            }
+        const JobQueue& queue = jobQueues[name];
+        if (filter.unique.empty()) {
+            listAll(queue, filter, jobs);
+        } else if (listFirst(queue, filter, jobs)) {
+            return;
         }
     }
 }

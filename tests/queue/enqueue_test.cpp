@@ -85,7 +85,7 @@ TEST_P(RefusedJob, IsRefusedByTheFirstReason) {
         addHeld(Job::ACTION_RESTORE);
     }
     if (GetParam().sameWorkWaits) {
-        addHeld(Job::ACTION_RELINK).setUniqueString("n");
+        addUnique(Job::ACTION_RELINK, "n");
     }
     const std::string before = ask(R"({"op":"job_list"})");
     nextJobId = 1;
@@ -243,7 +243,7 @@ TEST_F(Enqueue, LeavesAGapInTheIdsForASecondJobOfTheSameWork) {
 }
 
 TEST_F(Enqueue, FindsTheSameWorkAlsoInAnotherQueueAndWhileItStops) {
-    addHeld(Job::ACTION_COPY_TO, Job::STATUS_STOPPING).setUniqueString("n");
+    addUnique(Job::ACTION_COPY_TO, "n", Job::STATUS_STOPPING);
 
     EXPECT_EQ(R"({"code":409})", ask(heldRequest(Job::ACTION_BACKUP, "n")));
 }

@@ -60,10 +60,11 @@ TEST_F(GetJob, DoesNotFindAnUnknownId) {
 
 TEST_F(GetJob, ShowsTheJobAsItIs) {
     addHeld(Job::ACTION_RESTORE);
-    Job& job = addWithProcess(4711, Job::STATUS_STOPPING);
-    job.setCommandBranch("verify");
-    job.setUniqueString("u");
-    job.setParam("name", "n");
+    change(addWithProcess(4711, Job::STATUS_STOPPING), [](Job& job) {
+        job.setCommandBranch("verify");
+        job.setUniqueString("u");
+        job.setParam("name", "n");
+    });
     addHeld(Job::ACTION_BACKUP);
 
     EXPECT_EQ(R"({"code":200,"job":{"action":1,"backend":"held","branch":"verify","job_id":2,"param":{"name":"n"},)"
@@ -114,7 +115,7 @@ TEST_F(RemoveJob, TakesAWaitingJobOutOfItsQueue) {
 }
 
 TEST_F(RemoveJob, StopsARunningJobWhichIsListedUntilItHasEnded) {
-    Job& job = launched(addHeld(Job::ACTION_BACKUP));
+    const Job& job = launched(addHeld(Job::ACTION_BACKUP));
     diary.take();
 
     EXPECT_EQ(R"({"code":200})", ask(removeRequest("1")));
@@ -130,8 +131,8 @@ TEST_F(RemoveJob, StopsARunningJobWhichIsListedUntilItHasEnded) {
 
 TEST_F(RemoveJob, SendsNothingMoreToAJobThatIsStopping) {
     support::Gate gate(folder.path("gate"));
-    Job& job = launched(addScript(Job::ACTION_BACKUP, "read line < " + gate.path() + "; exit 5"));
-    job.setStatus(Job::STATUS_STOPPING);
+    const Job& job = launched(addScript(Job::ACTION_BACKUP, "read line < " + gate.path() + "; exit 5"));
+    setStatus(job, Job::STATUS_STOPPING);
     diary.take();
 
     EXPECT_EQ(R"({"code":200})", ask(removeRequest("1")));

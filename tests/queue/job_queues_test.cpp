@@ -196,11 +196,10 @@ TEST_F(JobQueues, AreEmptyOrNotOneByOne) {
 TEST_F(JobQueues, FindTheSameUniqueStringInEveryStatus) {
     Job candidate;
     candidate.setUniqueString("the same");
-    Job& other = addHeld(Job::ACTION_RESTORE);
-    other.setUniqueString("the same");
+    const Job& other = addUnique(Job::ACTION_RESTORE, "the same");
 
     for (const int status : {Job::STATUS_NONE, Job::STATUS_QUEUED, Job::STATUS_RUNNING, Job::STATUS_STOPPING}) {
-        other.setStatus(static_cast<Job::Status>(status));
+        setStatus(other, static_cast<Job::Status>(status));
         EXPECT_TRUE(queue_is_same_unique(candidate)) << status;
     }
 }
@@ -208,16 +207,16 @@ TEST_F(JobQueues, FindTheSameUniqueStringInEveryStatus) {
 TEST_F(JobQueues, FindTheSameUniqueStringBehindOthers) {
     Job candidate;
     candidate.setUniqueString("c");
-    addHeld(Job::ACTION_BACKUP).setUniqueString("a");
-    addHeld(Job::ACTION_BACKUP).setUniqueString("b");
+    addUnique(Job::ACTION_BACKUP, "a");
+    addUnique(Job::ACTION_BACKUP, "b");
     EXPECT_FALSE(queue_is_same_unique(candidate));
 
-    addHeld(Job::ACTION_TARGET_COPY_TO).setUniqueString("c");
+    addUnique(Job::ACTION_TARGET_COPY_TO, "c");
     EXPECT_TRUE(queue_is_same_unique(candidate));
 }
 
 TEST_F(JobQueues, CompareUniqueStringsByteByByte) {
-    addHeld(Job::ACTION_BACKUP).setUniqueString(std::string("a\0b", 3));
+    addUnique(Job::ACTION_BACKUP, std::string("a\0b", 3));
     Job candidate;
 
     for (const std::string& other : {std::string("a"), std::string("a\0c", 3), std::string("A\0b", 3), std::string()}) {

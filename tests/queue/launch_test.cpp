@@ -80,10 +80,10 @@ TEST_P(UnrunnableCommand, EndsTheJobsProcessWith127) {
 
 TEST_F(Launch, StartsTheJobsProcessAndMarksTheJobRunning) {
     support::Gate gate(folder.path("gate"));
-    Job& job = addScript(Job::ACTION_BACKUP, "read line < " + gate.path() + "; exit 6");
+    const Job& job = addScript(Job::ACTION_BACKUP, "read line < " + gate.path() + "; exit 6");
     const std::string queued = job.toString();
 
-    EXPECT_TRUE(do_launch_job(job));
+    EXPECT_TRUE(launch(job));
 
     EXPECT_EQ(Job::STATUS_RUNNING, job.getStatus());
     const std::string pid = std::to_string(job.getPid());
@@ -104,11 +104,11 @@ TEST_F(Launch, RunsTheCommandOfTheJobsBranch) {
 }
 
 TEST_F(Launch, OfABackendThatIsGoneStartsNothing) {
-    Job& job = addHeld(Job::ACTION_BACKUP);
+    const Job& job = addHeld(Job::ACTION_BACKUP);
     const std::string queued = job.toString();
     support::removeLocalBackend("held");
 
-    EXPECT_FALSE(do_launch_job(job));
+    EXPECT_FALSE(launch(job));
 
     EXPECT_THAT(diary.take(), ElementsAre("launch job [" + queued + "]"));
     expectLocated(log, LOG_ERR, getpid(), QUEUE_UNIT, "wrong backend [" + queued + "]");
@@ -117,21 +117,21 @@ TEST_F(Launch, OfABackendThatIsGoneStartsNothing) {
 
 TEST_F(Launch, OfABackendWithoutTheActionStartsNothing) {
     support::writeLocalBackend("held", "[restore]\ncommand_launch = /bin/true\n");
-    Job& job = addHeld(Job::ACTION_BACKUP);
+    const Job& job = addHeld(Job::ACTION_BACKUP);
 
-    EXPECT_FALSE(do_launch_job(job));
+    EXPECT_FALSE(launch(job));
 
     expectLocated(log, LOG_ERR, getpid(), QUEUE_UNIT, "wrong backend [" + job.toString() + "]");
 }
 
 TEST_F(Launch, WithoutRoomForAProcessSaysWhy) {
     SKIP_IF_EMULATED(support::REFUSED_CALLS);
-    Job& job = addHeld(Job::ACTION_BACKUP);
+    const Job& job = addHeld(Job::ACTION_BACKUP);
     const std::string queued = job.toString();
 
     const pid_t daemon = support::startInChild([&job]() {
         support::refuseSystemCalls({SYS_clone, SYS_clone3}, EAGAIN);
-        return !do_launch_job(job) && job.getStatus() == Job::STATUS_QUEUED && job.getPid() == -1 ? 0 : 1;
+        return !launch(job) && job.getStatus() == Job::STATUS_QUEUED && job.getPid() == -1 ? 0 : 1;
     });
 
     EXPECT_EQ("exit 0", describeStatus(waitForChild(daemon)));
@@ -141,7 +141,7 @@ TEST_F(Launch, WithoutRoomForAProcessSaysWhy) {
 
 TEST_F(Launch, WithoutRoomForAProcessDropsTheJob) {
     SKIP_IF_EMULATED(support::REFUSED_CALLS);
-    Job& job = addHeld(Job::ACTION_BACKUP);
+    const Job& job = addHeld(Job::ACTION_BACKUP);
     const std::string queued = job.toString();
 
     const pid_t daemon = support::startInChild([]() {
@@ -159,9 +159,9 @@ TEST_F(Launch, OfAJobThatIsRemovedAtOnceStartsAProcessThatDies) {
     const HandledSignal term(SIGTERM);
 
     for (int round = 0; round < 50 && !HasFailure(); ++round) {
-        Job& job = launched(addHeld(Job::ACTION_BACKUP));
+        const Job& job = launched(addHeld(Job::ACTION_BACKUP));
         bool removeJob = false;
-        sendSignalCb("backup", job, removeJob, nullptr);
+        change(job, [&removeJob](Job& running) { sendSignalCb("backup", running, removeJob, nullptr); });
 
         awaitEnd(job.getPid());
         EXPECT_EQ("signal 15", describeStatus(waitForChild(job.getPid()))) << "round " << round;

@@ -148,9 +148,10 @@ TEST_P(BadListFilter, IsRefusedByName) {
 }
 
 TEST_F(ListJobs, ShowsProcessesAndStatuses) {
-    Job& job = jobQueues["restore"].front();
-    job.setStatus(Job::STATUS_STOPPING);
-    job.setPid(4711);
+    change(jobQueues["restore"].front(), [](Job& job) {
+        job.setStatus(Job::STATUS_STOPPING);
+        job.setPid(4711);
+    });
 
     EXPECT_EQ(R"({"code":200,"jobs":[{"action":2,"backend":"held","job_id":1,"param":{"size":5},"pid":4711,)"
               R"("status":3,"unique":"a"}]})",

@@ -79,32 +79,54 @@ QueueTest::~QueueTest() {
     support::removeAllBackends();
 }
 
-Job& QueueTest::add(const Job& job, Job::Status status) {
-    std::list<Job>& queue = jobQueues[MARU::Backup::action2str(job.getAction())];
-    queue.push_back(job);
-    queue.back().setJobId(MARU::Backup::queue_take_job_id());
-    queue.back().setStatus(status);
+const Job& QueueTest::add(const Job& job, Job::Status status) {
+    Job admitted = job;
+    admitted.setJobId(MARU::Backup::queue_take_job_id());
+    admitted.setStatus(status);
+    MARU::Backup::JobQueue& queue = jobQueues[MARU::Backup::action2str(job.getAction())];
+    queue.push_back(admitted);
     return queue.back();
 }
 
-Job& QueueTest::addHeld(Job::Action action, Job::Status status) {
+const Job& QueueTest::addHeld(Job::Action action, Job::Status status) {
     return add(Job("held", action), status);
 }
 
-Job& QueueTest::addScript(Job::Action action, const std::string& script) {
+const Job& QueueTest::addUnique(Job::Action action, const std::string& unique, Job::Status status) {
+    Job job("held", action);
+    job.setUniqueString(unique);
+    return add(job, status);
+}
+
+const Job& QueueTest::addScript(Job::Action action, const std::string& script) {
     Job job("shell", action);
     job.setParam("script", script);
     return add(job);
 }
 
-Job& QueueTest::addWithProcess(pid_t pid, Job::Status status) {
-    Job& job = addHeld(Job::ACTION_BACKUP, status);
+const Job& QueueTest::addWithProcess(pid_t pid, Job::Status status) {
+    Job job("held", Job::ACTION_BACKUP);
     job.setPid(pid);
-    return job;
+    return add(job, status);
 }
 
-Job& QueueTest::launched(Job& job) {
-    EXPECT_TRUE(MARU::Backup::do_launch_job(job));
+void QueueTest::change(const Job& job, const std::function<void(Job&)>& change) {
+    MARU::Backup::JobQueue& queue = jobQueues.at(MARU::Backup::action2str(job.getAction()));
+    queue.change(queue.placeOf(job), change);
+}
+
+void QueueTest::setStatus(const Job& job, Job::Status status) {
+    change(job, [status](Job& changed) { changed.setStatus(status); });
+}
+
+bool QueueTest::launch(const Job& job) {
+    bool hasProcess = false;
+    change(job, [&hasProcess](Job& queued) { hasProcess = MARU::Backup::do_launch_job(queued); });
+    return hasProcess;
+}
+
+const Job& QueueTest::launched(const Job& job) {
+    EXPECT_TRUE(launch(job));
     return job;
 }
 

@@ -2,6 +2,7 @@
 
 #include <sys/types.h>
 
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -49,18 +50,27 @@ protected:
     ~QueueTest() override;
 
     /** Appends a job with the next id to the queue of its action. */
-    MARU::Backup::Job& add(const MARU::Backup::Job& job,
-                           MARU::Backup::Job::Status status = MARU::Backup::Job::STATUS_QUEUED);
+    const MARU::Backup::Job& add(const MARU::Backup::Job& job,
+                                 MARU::Backup::Job::Status status = MARU::Backup::Job::STATUS_QUEUED);
     /** The same for a job of the backend "held". */
-    MARU::Backup::Job& addHeld(MARU::Backup::Job::Action action,
-                               MARU::Backup::Job::Status status = MARU::Backup::Job::STATUS_QUEUED);
+    const MARU::Backup::Job& addHeld(MARU::Backup::Job::Action action,
+                                     MARU::Backup::Job::Status status = MARU::Backup::Job::STATUS_QUEUED);
+    /** The same with that unique string. */
+    const MARU::Backup::Job& addUnique(MARU::Backup::Job::Action action, const std::string& unique,
+                                       MARU::Backup::Job::Status status = MARU::Backup::Job::STATUS_QUEUED);
     /** The same for a job of the backend "shell". */
-    MARU::Backup::Job& addScript(MARU::Backup::Job::Action action, const std::string& script);
+    const MARU::Backup::Job& addScript(MARU::Backup::Job::Action action, const std::string& script);
     /** The same for one that has that process, whoever's it is. */
-    MARU::Backup::Job& addWithProcess(pid_t pid, MARU::Backup::Job::Status status);
+    const MARU::Backup::Job& addWithProcess(pid_t pid, MARU::Backup::Job::Status status);
 
-    /** Starts the job's process, which is a child of the test's. */
-    MARU::Backup::Job& launched(MARU::Backup::Job& job);
+    /** Calls change(Job&) for a job of the store. */
+    static void change(const MARU::Backup::Job& job, const std::function<void(MARU::Backup::Job&)>& change);
+    static void setStatus(const MARU::Backup::Job& job, MARU::Backup::Job::Status status);
+
+    /** Starts the process of a job of the store, which is a child of the test's. Whether there is one. */
+    static bool launch(const MARU::Backup::Job& job);
+    /** The same where there must be one. */
+    const MARU::Backup::Job& launched(const MARU::Backup::Job& job);
 
     /** The ids of the jobs in a queue. */
     static std::vector<int> ids(const std::string& queueName);

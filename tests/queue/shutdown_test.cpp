@@ -99,8 +99,8 @@ TEST_F(Shutdown, KillsAJobThatIgnoresSigtermAfterFiveFullSecondsWhateverElseEnds
 }
 
 TEST_F(Shutdown, KillsAStoppingJobWithoutAnotherSigterm) {
-    Job& job = launched(addHeld(Job::ACTION_BACKUP));
-    job.setStatus(Job::STATUS_STOPPING);
+    const Job& job = launched(addHeld(Job::ACTION_BACKUP));
+    setStatus(job, Job::STATUS_STOPPING);
 
     const std::vector<std::string> lines = killAll();
 

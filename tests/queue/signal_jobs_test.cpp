@@ -28,11 +28,14 @@ namespace {
 class SignalToAJob : public QueueTest {
 protected:
     /** Sends it; whether the job has to be removed now. No signal is SIGTERM. */
-    bool send(Job& job, const int* signal = nullptr) {
+    bool send(const Job& job, const int* signal = nullptr) {
         diary.take();
         bool removeJob = false;
         int number = signal != nullptr ? *signal : 0;
-        EXPECT_EQ(QUEUE_ITER_CONTINUE, sendSignalCb("backup", job, removeJob, signal != nullptr ? &number : nullptr));
+        change(job, [&](Job& signalled) {
+            EXPECT_EQ(QUEUE_ITER_CONTINUE,
+                      sendSignalCb("backup", signalled, removeJob, signal != nullptr ? &number : nullptr));
+        });
         return removeJob;
     }
 };
@@ -44,7 +47,7 @@ const int KILL = SIGKILL;
 
 TEST_F(SignalToAJob, ThatWasNeverLaunchedRemovesItWithoutAWord) {
     for (const int status : {Job::STATUS_QUEUED, Job::STATUS_RUNNING, Job::STATUS_STOPPING}) {
-        Job& job = addHeld(Job::ACTION_BACKUP, static_cast<Job::Status>(status));
+        const Job& job = addHeld(Job::ACTION_BACKUP, static_cast<Job::Status>(status));
 
         EXPECT_TRUE(send(job)) << status;
 
@@ -55,7 +58,7 @@ TEST_F(SignalToAJob, ThatWasNeverLaunchedRemovesItWithoutAWord) {
 }
 
 TEST_F(SignalToAJob, IsSigtermIfNoneIsGiven) {
-    Job& job = launched(addHeld(Job::ACTION_BACKUP));
+    const Job& job = launched(addHeld(Job::ACTION_BACKUP));
 
     EXPECT_FALSE(send(job));
 
@@ -66,7 +69,7 @@ TEST_F(SignalToAJob, IsSigtermIfNoneIsGiven) {
 
 TEST_F(SignalToAJob, IsTheOneThatIsGiven) {
     for (const int signal : {SIGTERM, SIGKILL, SIGUSR1}) {
-        Job& job = launched(addHeld(Job::ACTION_COPY_TO));
+        const Job& job = launched(addHeld(Job::ACTION_COPY_TO));
 
         EXPECT_FALSE(send(job, &signal));
 
@@ -78,8 +81,8 @@ TEST_F(SignalToAJob, IsTheOneThatIsGiven) {
 
 TEST_F(SignalToAJob, ThatIsStoppingIsNotAnotherSigterm) {
     support::Gate gate(folder.path("gate"));
-    Job& job = launched(addScript(Job::ACTION_BACKUP, "read line < " + gate.path() + "; exit 4"));
-    job.setStatus(Job::STATUS_STOPPING);
+    const Job& job = launched(addScript(Job::ACTION_BACKUP, "read line < " + gate.path() + "; exit 4"));
+    setStatus(job, Job::STATUS_STOPPING);
 
     EXPECT_FALSE(send(job));
     EXPECT_THAT(diary.take(), IsEmpty());
@@ -91,8 +94,8 @@ TEST_F(SignalToAJob, ThatIsStoppingIsNotAnotherSigterm) {
 }
 
 TEST_F(SignalToAJob, ThatIsStoppingIsStillAnyOtherSignal) {
-    Job& job = launched(addHeld(Job::ACTION_BACKUP));
-    job.setStatus(Job::STATUS_STOPPING);
+    const Job& job = launched(addHeld(Job::ACTION_BACKUP));
+    setStatus(job, Job::STATUS_STOPPING);
 
     EXPECT_FALSE(send(job, &KILL));
 
@@ -101,7 +104,7 @@ TEST_F(SignalToAJob, ThatIsStoppingIsStillAnyOtherSignal) {
 }
 
 TEST_F(SignalToAJob, WhoseProcessIsGoneIsNoMistake) {
-    Job& job = launched(addScript(Job::ACTION_BACKUP, "exit 0"));
+    const Job& job = launched(addScript(Job::ACTION_BACKUP, "exit 0"));
     waitForChild(job.getPid());
 
     EXPECT_FALSE(send(job));
@@ -112,7 +115,7 @@ TEST_F(SignalToAJob, WhoseProcessIsGoneIsNoMistake) {
 }
 
 TEST_F(SignalToAJob, ThatMayNotBeSentIsReportedAndCountsAsSent) {
-    Job& job = addWithProcess(1, Job::STATUS_RUNNING);
+    const Job& job = addWithProcess(1, Job::STATUS_RUNNING);
 
     const pid_t daemon = support::startInChild([&]() {
         openlog(nullptr, LOG_NDELAY, 0);
@@ -127,7 +130,7 @@ TEST_F(SignalToAJob, ThatMayNotBeSentIsReportedAndCountsAsSent) {
 
 TEST_F(SignalToAJob, ThatTheKernelRefusesIsReportedForEachSignal) {
     SKIP_IF_EMULATED(support::REFUSED_CALLS);
-    Job& job = addWithProcess(getpid(), Job::STATUS_RUNNING);
+    const Job& job = addWithProcess(getpid(), Job::STATUS_RUNNING);
 
     const pid_t daemon = support::startInChild([&]() {
         support::refuseSystemCalls({SYS_kill}, EINVAL);

@@ -174,8 +174,8 @@ TEST_F(Supervision, RemovesAJobWhoseProcessHasEndedAndSaysHow) {
 }
 
 TEST_F(Supervision, RemovesAStoppingJobWhoseProcessHasEnded) {
-    Job& job = launched(addScript(Job::ACTION_BACKUP, "exit 0"));
-    job.setStatus(Job::STATUS_STOPPING);
+    const Job& job = launched(addScript(Job::ACTION_BACKUP, "exit 0"));
+    setStatus(job, Job::STATUS_STOPPING);
     awaitEnd(job.getPid());
 
     EXPECT_THAT(check(), ElementsAre("job [1] exit(0)"));
@@ -211,7 +211,7 @@ TEST_F(Supervision, LeavesWaitingAndRunningJobsAlone) {
 }
 
 TEST_F(Supervision, LeavesAProcessThatIsHeldByASignalAlone) {
-    Job& job = launched(addHeld(Job::ACTION_BACKUP));
+    const Job& job = launched(addHeld(Job::ACTION_BACKUP));
     kill(job.getPid(), SIGSTOP);
     siginfo_t info = {};
     ASSERT_EQ(0, waitid(P_PID, static_cast<id_t>(job.getPid()), &info, WSTOPPED | WNOWAIT));
