@@ -1,6 +1,7 @@
 #include "queue/job_queues.h"
 
 #include <climits>
+#include <new>
 #include <ostream>
 
 #include <boost/function.hpp>
@@ -172,6 +173,46 @@ TEST_F(JobQueues, CallingAnEmptyCallbackThrows) {
     EXPECT_THROW(queue_foreach_job(QueueIterCallback(), nullptr), boost::bad_function_call);
 
     EXPECT_THAT(ids("backup"), ElementsAre(1));
+}
+
+TEST_F(JobQueues, FindAJobByWhatACallbackMadeOfItAlsoIfThatThrew) {
+    addUnique(Job::ACTION_BACKUP, "before");
+
+    EXPECT_THROW(queue_foreach_job(
+                     [](const std::string&, Job& job, bool&, void*) -> QueueIterControl {
+                         job.setJobId(7);
+                         job.setUniqueString("after");
+                         job.setStatus(Job::STATUS_NONE);
+                         throw std::bad_alloc();
+                     },
+                     nullptr),
+                 std::bad_alloc);
+
+    ASSERT_NE(nullptr, queue_find_job(7));
+    EXPECT_EQ(nullptr, queue_find_job(1));
+    EXPECT_EQ("after", queue_find_job(7)->getUniqueString());
+    EXPECT_FALSE(queue_is_same_unique(Job()));
+    EXPECT_TRUE(queue_is_same_unique(*queue_find_job(7)));
+    EXPECT_EQ(1U, jobQueues["backup"].countNotWaiting());
+}
+
+TEST_F(JobQueues, VisitTheFirstOfSeveralJobsWithTheSameId) {
+    addHeld(Job::ACTION_RESTORE);
+    nextJobId = 1;
+    addUnique(Job::ACTION_BACKUP, "first");
+    nextJobId = 1;
+    addUnique(Job::ACTION_BACKUP, "second");
+    const auto remove = [](const std::string&, Job&, bool& removeJob, void*) {
+        removeJob = true;
+        return QUEUE_ITER_CONTINUE;
+    };
+
+    EXPECT_TRUE(queue_visit_job(1, remove, nullptr));
+
+    ASSERT_THAT(ids("backup"), ElementsAre(1));
+    EXPECT_EQ("second", jobQueues["backup"].front().getUniqueString());
+    EXPECT_THAT(ids("restore"), ElementsAre(1));
+    EXPECT_FALSE(queue_visit_job(2, remove, nullptr));
 }
 
 TEST_F(JobQueues, ThatWereNeverUsedAreEmptyAndStayUnused) {
