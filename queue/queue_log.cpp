@@ -16,11 +16,15 @@ void queueLog(int level, const char* format, ...) {
         return;
     }
     const int callersErrno = errno;
+    // Standard error is not buffered: a line that is written at one stroke costs
+    // one system call, and stays whole beside what the jobs write there. Formats
+    // are short literals of ours, so this holds any of them.
+    char whole[256];
+    std::snprintf(whole, sizeof whole, "%s\n", format);
     va_list arguments;
     va_start(arguments, format);
-    std::vfprintf(stderr, format, arguments);
+    std::vfprintf(stderr, whole, arguments);
     va_end(arguments);
-    std::fputc('\n', stderr);
     errno = callersErrno;
 }
 

@@ -62,6 +62,23 @@ TEST_F(TheDiary, LeavesErrnoAloneAlsoWhenItCannotBeWritten) {
     EXPECT_EQ("exit 0", support::describeStatus(status));
 }
 
+TEST_F(TheDiary, IsWrittenALineAtAStroke) {
+    int packets[2]; // each read gets one write
+    ASSERT_EQ(0, pipe2(packets, O_CLOEXEC | O_DIRECT));
+
+    support::runInChild([&packets]() {
+        dup2(packets[1], STDERR_FILENO);
+        queueLog(LOG_INFO, "remove job [%d]", 3);
+        return 0;
+    });
+
+    char packet[100];
+    const ssize_t size = read(packets[0], packet, sizeof packet);
+    EXPECT_EQ("remove job [3]\n", std::string(packet, size > 0 ? static_cast<std::size_t>(size) : 0));
+    close(packets[0]);
+    close(packets[1]);
+}
+
 TEST_F(TheDiary, SwallowsNothingOfALongLine) {
     const std::string text(100000, 'x');
 
