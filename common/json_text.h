@@ -1,6 +1,8 @@
 #pragma once
 
+#include <cstdint>
 #include <string>
+#include <string_view>
 
 namespace Json {
 class Value;
@@ -23,7 +25,7 @@ constexpr int MAX_NESTING = 64;
  * When it is false, `value` holds what was read up to the mistake, or is
  * unchanged: a caller that must not see half a value parses into a local one.
  */
-bool fromString(const std::string& text, Json::Value& value);
+bool fromString(std::string_view text, Json::Value& value);
 
 /**
  * The text of `value`: compact, members in the order of their names, without a
@@ -31,6 +33,25 @@ bool fromString(const std::string& text, Json::Value& value);
  * requires to be escaped.
  */
 std::string toString(const Json::Value& value);
+
+// The same, behind what is in `out` already.
+
+void appendJson(std::string& out, const Json::Value& value);
+void appendJsonString(std::string& out, std::string_view text);
+void appendJsonInteger(std::string& out, std::int64_t number);
+
+/**
+ * Whether fromString() brings back exactly `value` from its text. It does not
+ * bring back an unsigned type of a small number, a number that is not finite, or
+ * what nests too deeply.
+ */
+bool isReadBack(const Json::Value& value);
+
+/**
+ * The text of the member `name` within `object`, the text that toString() made of an
+ * object; empty if there is none. It lives as long as `object`.
+ */
+std::string_view memberText(std::string_view object, std::string_view name);
 
 /** How many levels of arrays and objects `value` has: 0 for a number, 1 for {}. */
 int nestingOf(const Json::Value& value);

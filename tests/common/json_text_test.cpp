@@ -1,6 +1,7 @@
 #include "common/json_text.h"
 
 #include <atomic>
+#include <cstdint>
 #include <limits>
 #include <string>
 #include <thread>
@@ -10,13 +11,20 @@
 #include <json/value.h>
 #include <json/writer.h>
 
+#include "support/random_json.h"
+
 namespace {
 
+using MARU::Backup::appendJson;
+using MARU::Backup::appendJsonInteger;
+using MARU::Backup::appendJsonString;
 using MARU::Backup::fromString;
 using MARU::Backup::hasTextForm;
 using MARU::Backup::isInt32;
+using MARU::Backup::isReadBack;
 using MARU::Backup::MAX_NESTING;
 using MARU::Backup::member;
+using MARU::Backup::memberText;
 using MARU::Backup::nestingOf;
 using MARU::Backup::toString;
 
@@ -261,6 +269,72 @@ TEST(JsonWriter, EscapesOnlyWhatJsonRequires) {
     EXPECT_EQ("\"\xc3\xa9\xe2\x82\xac\xf0\x9f\x98\x80\"", toString("\xc3\xa9\xe2\x82\xac\xf0\x9f\x98\x80"));
     EXPECT_EQ("\"\x80\xff\xc3\xed\xa0\x80\"", toString("\x80\xff\xc3\xed\xa0\x80"));
     EXPECT_EQ("{\"\\n\xff\":1}", toString(parsed("{\"\\n\xff\":1}")));
+}
+
+/** What jsoncpp writes, set up like ours. */
+std::string referenceText(const Json::Value& value) {
+    Json::StreamWriterBuilder builder;
+    builder["indentation"] = "";
+    builder["commentStyle"] = "None";
+    builder["emitUTF8"] = true;
+    return Json::writeString(builder, value);
+}
+
+TEST(JsonWriter, WritesAnyValueAsJsoncppDoes) {
+    support::RandomJson random(1);
+    for (int round = 0; round < 5000; ++round) {
+        const Json::Value value = random.value(5);
+        ASSERT_EQ(referenceText(value), toString(value));
+    }
+    const double NUMBERS[] = {0.0,
+                              -0.0,
+                              1e16,
+                              1e17,
+                              1e-5,
+                              std::numeric_limits<double>::denorm_min(),
+                              std::numeric_limits<double>::infinity(),
+                              -std::numeric_limits<double>::infinity(),
+                              std::numeric_limits<double>::quiet_NaN()};
+    for (const double number : NUMBERS) {
+        EXPECT_EQ(referenceText(number), toString(number));
+    }
+}
+
+TEST(JsonWriter, AppendsBehindWhatIsThere) {
+    std::string text = "[";
+    appendJson(text, parsed("{\"a\":[]}"));
+    text += ',';
+    appendJsonString(text, "a\nb");
+    text += ',';
+    appendJsonInteger(text, std::numeric_limits<std::int64_t>::min());
+    EXPECT_EQ("[{\"a\":[]},\"a\\nb\",-9223372036854775808", text);
+}
+
+TEST(JsonText, IsReadBackExactlyWhereItIsSaidToBe) {
+    support::RandomJson random(2);
+    for (int round = 0; round < 5000; ++round) {
+        const Json::Value value = random.value(4);
+        Json::Value back;
+        const bool same = fromString(toString(value), back) && back == value;
+        ASSERT_EQ(same, isReadBack(value)) << toString(value);
+    }
+    EXPECT_TRUE(isReadBack(parsed(nested(MAX_NESTING, ""))));
+    Json::Value tooDeep;
+    tooDeep.append(parsed(nested(MAX_NESTING, "")));
+    EXPECT_FALSE(isReadBack(tooDeep));
+}
+
+TEST(JsonText, HasEachMemberWhereItIsLookedFor) {
+    support::RandomJson random(3);
+    for (int round = 0; round < 5000; ++round) {
+        const Json::Value object = random.object(4);
+        const std::string text = toString(object);
+        for (const std::string& name : object.getMemberNames()) {
+            ASSERT_EQ(toString(object[name]), memberText(text, name)) << text;
+        }
+        const std::string other = random.text();
+        ASSERT_EQ(object.isMember(other), !memberText(text, other).empty()) << text;
+    }
 }
 
 TEST(JsonText, BringsBackEveryByteOfAString) {
