@@ -1,23 +1,87 @@
 #include <marubackup/job.h>
 
 #include <ostream>
+#include <type_traits>
 
 #include "common/json_text.h"
+#include "job/job_record.h"
 
 namespace MARU {
 namespace Backup {
 
-class JobPrivate {
-public:
-    int jobId = -1;
-    std::string backend;
-    Job::Action action = Job::ACTION_NONE;
-    Job::Status status = Job::STATUS_NONE;
-    int pid = -1;
-    Json::Value params = Json::Value(Json::objectValue);
-    std::string unique;
-    std::string branch;
-};
+namespace {
+
+/**
+ * Hands out the members of the JSON form, in the order of their names, which is
+ * the order in a text.
+ */
+template <class Take>
+void forEachMember(const JobPrivate& job, const Take& take) {
+    take("action", static_cast<int>(job.action));
+    take("backend", job.backend);
+    if (!job.branch.empty()) {
+        take("branch", job.branch);
+    }
+    if (job.jobId != -1) {
+        take("job_id", job.jobId);
+    }
+    take("param", job.params);
+    if (job.pid != -1) {
+        take("pid", job.pid);
+    }
+    take("status", static_cast<int>(job.status));
+    take("unique", job.unique);
+}
+
+// A member as a value
+
+int asJson(int number) {
+    return number;
+}
+
+const std::string& asJson(const std::string& text) {
+    return text;
+}
+
+Json::Value asJson(const JobParams& params) {
+    return params.all();
+}
+
+// A member as text
+
+void appendMember(std::string& out, int number) {
+    appendJsonInteger(out, number);
+}
+
+void appendMember(std::string& out, const std::string& text) {
+    appendJsonString(out, text);
+}
+
+void appendMember(std::string& out, const JobParams& params) {
+    params.appendTo(out);
+}
+
+} // namespace
+
+void JobPrivate::appendTo(std::string& out) const {
+    char before = '{';
+    forEachMember(*this, [&](const char* name, const auto& member) {
+        out += before;
+        out += '"';
+        out += name;
+        out += "\":";
+        appendMember(out, member);
+        before = ',';
+    });
+    out += '}';
+}
+
+const JobPrivate& recordOf(const Job& job) {
+    // A Job is the pointer to its record and nothing else, and the language lets
+    // such an object be taken for its one member.
+    static_assert(std::is_standard_layout_v<Job> && sizeof(Job) == sizeof(JobPrivate*));
+    return **reinterpret_cast<JobPrivate* const*>(&job);
+}
 
 Job::Job() : d(new JobPrivate) {
 }
@@ -96,37 +160,25 @@ void Job::setPid(int pid) {
 }
 
 Json::Value Job::getParams() const {
-    return d->params;
+    return d->params.all();
 }
 
 Json::Value Job::getParam(const std::string& name, const Json::Value& defaultValue) const {
-    return hasParam(name) ? d->params[name] : defaultValue;
+    Json::Value value;
+    return d->params.get(name, value) ? value : defaultValue;
 }
 
 bool Job::hasParam(const std::string& name) const {
-    return d->params.isMember(name);
+    return d->params.has(name);
 }
 
 void Job::setParam(const std::string& name, const Json::Value& value) {
-    d->params[name] = value;
+    d->params.set(name, value);
 }
 
 Json::Value Job::toJson() const {
     Json::Value json(Json::objectValue);
-    json["backend"] = d->backend;
-    json["action"] = static_cast<int>(d->action);
-    json["status"] = static_cast<int>(d->status);
-    json["param"] = d->params;
-    json["unique"] = d->unique;
-    if (!d->branch.empty()) {
-        json["branch"] = d->branch;
-    }
-    if (d->pid != -1) {
-        json["pid"] = d->pid;
-    }
-    if (d->jobId != -1) {
-        json["job_id"] = d->jobId;
-    }
+    forEachMember(*d, [&json](const char* name, const auto& member) { json[name] = asJson(member); });
     return json;
 }
 
@@ -158,12 +210,14 @@ bool Job::fromJson(const Json::Value& json) {
     if (unique.isString()) {
         d->unique = unique.asString();
     }
-    d->params = params;
+    d->params.assign(params);
     return true;
 }
 
 std::string Job::toString() const {
-    return Backup::toString(toJson());
+    std::string text;
+    d->appendTo(text);
+    return text;
 }
 
 std::ostream& operator<<(std::ostream& out, const Job& job) {

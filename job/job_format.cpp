@@ -9,6 +9,7 @@
 #include <marubackup/job.h>
 
 #include "common/json_text.h"
+#include "job/job_record.h"
 
 namespace MARU {
 namespace Backup {
@@ -35,22 +36,25 @@ std::string paramText(const Json::Value& param) {
 } // namespace
 
 bool _VarsMapperJob::operator()(const std::string& name, std::string& value) const {
+    const JobPrivate& record = recordOf(*job);
     if (name == "JOB_ID") {
         // One character, not the digits: installed backends name files and
         // variables after it, and must go on to find them.
-        value = static_cast<char>(job->getJobId());
+        value = static_cast<char>(record.jobId);
     } else if (name == "BACKEND") {
-        value = job->getBackend();
+        value = record.backend;
     } else if (name == "BRANCH") {
-        value = job->getCommandBranch();
+        value = record.branch;
     } else if (name == "UNIQUE") {
-        value = job->getUniqueString();
+        value = record.unique;
     } else if (name == "DATE") {
         value = localTimeNow();
-    } else if (job->hasParam(name)) {
-        value = paramText(job->getParam(name, Json::Value()));
     } else {
-        return false;
+        Json::Value param;
+        if (!record.params.get(name, param)) {
+            return false;
+        }
+        value = paramText(param);
     }
     return true;
 }
@@ -61,7 +65,7 @@ std::string Job::toFormatString(const std::string& format) const {
 }
 
 bool Job::isValidToEnqueue(const Job& job) {
-    if (job.getBackend().empty()) {
+    if (recordOf(job).backend.empty()) {
         return false;
     }
     switch (job.getAction()) {
