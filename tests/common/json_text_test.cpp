@@ -3,11 +3,13 @@
 #include <atomic>
 #include <cstdint>
 #include <limits>
+#include <memory>
 #include <string>
 #include <thread>
 #include <vector>
 
 #include <gtest/gtest.h>
+#include <json/reader.h>
 #include <json/value.h>
 #include <json/writer.h>
 
@@ -110,7 +112,7 @@ TEST(JsonReader, RefusesWhatIsNotStandardJson) {
         "1 2", "{}{}", "{} x", "[]]", "{}}", "null null", "nullnull", "1,", "\"a\"\"b\"", "{};",
         // commas, colons and brackets in the wrong places
         "}", "]", ",", ":", "[1,]", "[,1]", "[,]", "[1,,2]", "[1 2]", "[1:2]", "[1}", "{\"a\":1]", "{\"a\":1,}",
-        "{,\"a\":1}", "{\"a\" 1}", "{\"a\":}", "{:1}", "{\"a\"}", "{\"a\":1 \"b\":2}", "{\"a\":1:2}",
+        "{,\"a\":1}", "{\"a\" 1}", "{\"a\":}", "{:1}", "{\"a\"}", "{\"\":1,}", "{\"a\":1 \"b\":2}", "{\"a\":1:2}",
         // other languages' literals and names
         "True", "NULL", "None", "undefined", "NaN", "Infinity", "-Infinity", "[NaN]", "'a'", "{'a':1}", "{a:1}",
         "{1:2}", "{null:1}", "`a`", "a",
@@ -222,6 +224,40 @@ TEST(JsonReader, LeavesWhatItReadUpToTheMistake) {
         EXPECT_FALSE(fromString(row.text, value)) << row.text;
         EXPECT_EQ(row.left, toString(value)) << row.text;
     }
+}
+
+/** Replaces, removes or inserts a byte somewhere. */
+void damage(std::string& text, support::RandomJson& random) {
+    const std::size_t at = random.below(static_cast<unsigned int>(text.size()));
+    const char byte = "{}[]:,\"\\/ \n019-+.eEutn\x01\xff"[random.below(25)];
+    switch (random.below(3)) {
+    case 0:
+        text[at] = byte;
+        break;
+    case 1:
+        text.erase(at, 1);
+        break;
+    default:
+        text.insert(at, 1, byte);
+    }
+}
+
+TEST(JsonReader, ReadsAsJsoncppDoesWhatItTakes) {
+    const std::unique_ptr<Json::CharReader> reference(Json::CharReaderBuilder().newCharReader());
+    support::RandomJson random(4);
+    int taken = 0;
+    for (int round = 0; round < 10000; ++round) {
+        std::string text = random.value(4).toStyledString();
+        damage(text, random);
+        Json::Value value;
+        if (fromString(text, value)) {
+            Json::Value expected;
+            ASSERT_TRUE(reference->parse(text.data(), text.data() + text.size(), &expected, nullptr)) << text;
+            ASSERT_EQ(expected, value) << text;
+            ++taken;
+        }
+    }
+    EXPECT_LT(1000, taken);
 }
 
 TEST(JsonReader, TakesTheBytesOfAStringAsTheyAre) {
