@@ -8,6 +8,7 @@
 #include <csignal>
 #include <map>
 #include <memory>
+#include <new>
 #include <vector>
 
 #include <event2/buffer.h>
@@ -155,9 +156,21 @@ void rest(bufferevent* connection) {
     }
 }
 
+/**
+ * Sends what is in `replies`: at once what the socket takes, so that the loop
+ * need not come round again to learn that it is writable; the rest, or all if
+ * earlier replies wait, as the client reads. A failure shows when that is tried.
+ */
+void sendReplies(bufferevent* connection, evbuffer* replies) {
+    evbuffer* const output = bufferevent_get_output(connection);
+    if (evbuffer_get_length(output) == 0 && evbuffer_get_length(replies) > 0) {
+        evbuffer_write(replies, bufferevent_getfd(connection));
+    }
+    evbuffer_add_buffer(output, replies);
+}
+
 /** Answers the complete frame of `length` bytes that the input starts with. */
-bool answerFrame(bufferevent* connection, std::uint32_t length, const ListenContext& context) {
-    evbuffer* const input = bufferevent_get_input(connection);
+bool answerFrame(evbuffer* input, std::uint32_t length, evbuffer* replies, const ListenContext& context) {
     const std::size_t frameSize = FrameHeader().size() + length;
     const unsigned char* const frame = evbuffer_pullup(input, static_cast<ev_ssize_t>(frameSize));
     if (frame == nullptr) {
@@ -166,10 +179,10 @@ bool answerFrame(bufferevent* connection, std::uint32_t length, const ListenCont
     const char* const payload = reinterpret_cast<const char*>(frame) + FrameHeader().size();
     const std::string reply = context.priv->requestHandler(payload, length, context.server);
 
-    evbuffer* const output = bufferevent_get_output(connection);
     const FrameHeader header = frameHeader(static_cast<std::uint32_t>(reply.size()));
-    evbuffer_add(output, header.data(), header.size());
-    evbuffer_add(output, reply.data(), reply.size());
+    evbuffer_expand(replies, header.size() + reply.size());
+    evbuffer_add(replies, header.data(), header.size());
+    evbuffer_add(replies, reply.data(), reply.size());
     if (evbuffer_drain(input, frameSize) != 0) {
         LOG_LOCATED_ERR("evbuffer_drain failed");
         return false;
@@ -177,27 +190,42 @@ bool answerFrame(bufferevent* connection, std::uint32_t length, const ListenCont
     return true;
 }
 
-/** Answers every complete frame that waits in the connection's input, in order. */
-void readCallback(bufferevent* connection, void* argument) {
-    const ListenContext& context = *static_cast<ListenContext*>(argument);
-    evbuffer* const input = bufferevent_get_input(connection);
+/** How the frames of an input were worked off. */
+enum InputState {
+    INPUT_SERVED, ///< whatever more arrives may complete a frame
+    INPUT_FULL,   ///< no byte can arrive, and what is there can never be used
+};
+
+/** Answers every complete frame that waits in the input, in order. */
+InputState answerFrames(evbuffer* input, evbuffer* replies, const ListenContext& context) {
     FrameHeader header;
     while (evbuffer_copyout(input, header.data(), header.size()) == static_cast<ev_ssize_t>(header.size())) {
         const std::size_t waiting = evbuffer_get_length(input);
         const FrameState state = requestState(header, waiting);
         if (state == FRAME_COMPLETE) {
-            if (!answerFrame(connection, frameLength(header), context)) {
-                return;
+            if (!answerFrame(input, frameLength(header), replies, context)) {
+                return INPUT_SERVED;
             }
             continue;
         }
         if (state == FRAME_REFUSED) {
             LOG_LOCATED_ERR("protocol error");
         }
-        if (waiting >= MAX_UNREAD) {
-            rest(connection);
-        }
-        return;
+        return waiting >= MAX_UNREAD ? INPUT_FULL : INPUT_SERVED;
+    }
+    return INPUT_SERVED;
+}
+
+void readCallback(bufferevent* connection, void* argument) {
+    const ListenContext& context = *static_cast<ListenContext*>(argument);
+    const std::unique_ptr<evbuffer, void (*)(evbuffer*)> replies(evbuffer_new(), evbuffer_free);
+    if (!replies) {
+        throw std::bad_alloc();
+    }
+    const InputState state = answerFrames(bufferevent_get_input(connection), replies.get(), context);
+    sendReplies(connection, replies.get());
+    if (state == INPUT_FULL) {
+        rest(connection);
     }
 }
 
