@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <charconv>
 #include <map>
+#include <string_view>
 #include <system_error>
 
 namespace MARU {
@@ -17,22 +18,34 @@ namespace {
 
 using Options = std::map<std::string, std::string>;
 
-const char BLANKS[] = " \t";
-const char LINE_END_BLANKS[] = " \t\r";
+constexpr std::string_view BLANKS = " \t";
+constexpr std::string_view LINE_END_BLANKS = " \t\r";
 const std::size_t MAX_FILE_SIZE = 16 * 1024 * 1024;
+const std::size_t READ_MORE = 16 * 1024;
 
-/** Reads what `fd` holds; false if it cannot be read or is too large for a configuration. */
-bool readAll(int fd, std::string& content) {
-    char buffer[16 * 1024];
-    while (content.size() <= MAX_FILE_SIZE) {
-        const ssize_t got = read(fd, buffer, sizeof buffer);
-        if (got == 0) {
-            return true;
+/**
+ * Reads what `fd` holds; false if it cannot be read or is too large for a
+ * configuration. A file of the `expected` size takes one read.
+ */
+bool readAll(int fd, std::size_t expected, std::string& content) {
+    std::size_t size = 0;
+    content.resize(std::min(expected, MAX_FILE_SIZE) + 1);
+    while (size <= MAX_FILE_SIZE) {
+        if (size == content.size()) {
+            content.resize(size + READ_MORE);
         }
-        if (got > 0) {
-            content.append(buffer, static_cast<std::size_t>(got));
-        } else if (errno != EINTR) {
-            return false;
+        const ssize_t got = read(fd, &content[size], content.size() - size);
+        if (got < 0) {
+            if (errno != EINTR) {
+                return false;
+            }
+            continue;
+        }
+        size += static_cast<std::size_t>(got);
+        // There was room for more, so that much is all.
+        if (got == 0 || size == expected) {
+            content.resize(size);
+            return true;
         }
     }
     return false;
@@ -48,13 +61,14 @@ bool readRegularFile(const std::string& path, std::string& content) {
         return false;
     }
     struct stat info = {};
-    const bool done = fstat(fd, &info) == 0 && S_ISREG(info.st_mode) && readAll(fd, content);
+    const bool done =
+        fstat(fd, &info) == 0 && S_ISREG(info.st_mode) && readAll(fd, static_cast<std::size_t>(info.st_size), content);
     close(fd);
     return done;
 }
 
 /** `text` without the blanks before it and those of `endBlanks` behind it. */
-std::string trimmed(const std::string& text, const char* endBlanks) {
+std::string_view trimmed(std::string_view text, std::string_view endBlanks) {
     const std::size_t end = text.find_last_not_of(endBlanks) + 1; // 0 if there is nothing else
     const std::size_t start = std::min(text.find_first_not_of(BLANKS), end);
     return text.substr(start, end - start);
@@ -63,12 +77,12 @@ std::string trimmed(const std::string& text, const char* endBlanks) {
 /** Reads a file's lines and keeps the options of one section. */
 class SectionReader {
 public:
-    explicit SectionReader(const std::string& section) : wanted(section) {
+    explicit SectionReader(std::string_view section) : wanted(section) {
     }
 
     /** False if `text`, one line without its line end, is malformed. */
-    bool addLine(const std::string& text) {
-        const std::string line = trimmed(text, LINE_END_BLANKS);
+    bool addLine(std::string_view text) {
+        const std::string_view line = trimmed(text, LINE_END_BLANKS);
         if (line.empty() || line[0] == '#' || line[0] == ';') {
             return true;
         }
@@ -79,28 +93,28 @@ public:
     Options options;
 
 private:
-    bool addSection(const std::string& line) {
+    bool addSection(std::string_view line) {
         if (line.find(']') != line.size() - 1) {
             return false;
         }
-        const std::string name = trimmed(line.substr(1, line.size() - 2), BLANKS);
+        const std::string_view name = trimmed(line.substr(1, line.size() - 2), BLANKS);
         inside = name == wanted;
         found = found || inside;
         return !name.empty();
     }
 
-    bool addOption(const std::string& line) {
+    bool addOption(std::string_view line) {
         const std::size_t equals = line.find('=');
         if (equals == std::string::npos || equals == 0) {
             return false;
         }
         if (inside) {
-            options[trimmed(line.substr(0, equals), BLANKS)] = trimmed(line.substr(equals + 1), BLANKS);
+            options[std::string(trimmed(line.substr(0, equals), BLANKS))] = trimmed(line.substr(equals + 1), BLANKS);
         }
         return true;
     }
 
-    const std::string wanted;
+    const std::string_view wanted;
     bool inside = false;
 };
 
@@ -185,9 +199,10 @@ bool OptionMap::optSectionLoad(const std::string& path, const std::string& secti
         return false;
     }
     SectionReader reader(section);
-    for (std::size_t start = 0; start < content.size();) {
-        const std::size_t end = std::min(content.find('\n', start), content.size());
-        if (!reader.addLine(content.substr(start, end - start))) {
+    const std::string_view text = content;
+    for (std::size_t start = 0; start < text.size();) {
+        const std::size_t end = std::min(text.find('\n', start), text.size());
+        if (!reader.addLine(text.substr(start, end - start))) {
             return false;
         }
         start = end + 1;
