@@ -43,7 +43,7 @@ std::vector<const Job*> JobQueue::withUnique(const std::string& unique) const {
     }
     std::vector<const Job*> all;
     for (const Job& job : jobs) {
-        if (job.getUniqueString() == unique) {
+        if (recordOf(job).unique == unique) {
             all.push_back(&job);
         }
     }

@@ -12,6 +12,8 @@
 
 #include <marubackup/job.h>
 
+#include "job/job_record.h"
+
 namespace MARU {
 namespace Backup {
 
@@ -33,8 +35,8 @@ class JobQueue {
 
     struct UniqueOf {
         using result_type = std::string;
-        result_type operator()(const Job& job) const {
-            return job.getUniqueString();
+        const result_type& operator()(const Job& job) const {
+            return recordOf(job).unique;
         }
     };
 

@@ -4,6 +4,8 @@
 #include <cstddef>
 #include <iterator>
 
+#include "job/job_record.h"
+
 namespace MARU {
 namespace Backup {
 
@@ -94,7 +96,7 @@ bool queue_is_all_empty() {
 }
 
 bool queue_is_same_unique(const Job& job) {
-    const std::string unique = job.getUniqueString();
+    const std::string& unique = recordOf(job).unique;
     return std::any_of(jobQueues.begin(), jobQueues.end(),
                        [&unique](const auto& entry) { return entry.second.hasUnique(unique); });
 }

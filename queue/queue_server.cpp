@@ -18,6 +18,7 @@
 
 #include "command/protocol.h"
 #include "common/log.h"
+#include "job/job_record.h"
 #include "queue/child_process.h"
 #include "queue/queue_log.h"
 #include "queue/queue_server.h"
@@ -307,7 +308,7 @@ void ignoreSignal(int) {
 
 /** Stops the jobs of one backend; `arg` points at its name. */
 QueueIterControl killBackendJobsCb(const std::string& queueName, Job& job, bool& removeJob, void* arg) {
-    if (job.getBackend() == *static_cast<std::string*>(arg)) {
+    if (recordOf(job).backend == *static_cast<std::string*>(arg)) {
         sendSignalCb(queueName, job, removeJob, nullptr);
     }
     return QUEUE_ITER_CONTINUE;

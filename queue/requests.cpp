@@ -3,7 +3,12 @@
 #include <sys/time.h>
 #include <syslog.h>
 
+#include <cstddef>
 #include <cstdint>
+#include <list>
+#include <string>
+#include <string_view>
+#include <utility>
 
 #include <json/value.h>
 
@@ -14,6 +19,7 @@
 
 #include "command/protocol.h"
 #include "common/json_text.h"
+#include "job/job_record.h"
 #include "queue/job_queues.h"
 #include "queue/queue_log.h"
 #include "queue/queue_server.h"
@@ -23,9 +29,32 @@ namespace Backup {
 
 namespace {
 
-void refuse(Json::Value& reply, ReplyCode code) {
-    reply[Member::CODE] = code;
-}
+/**
+ * The text of a reply: its code, and one other member at most, whose name comes
+ * behind "code" in the alphabet as they all do. Until it is refused it says that
+ * all is well.
+ */
+class Reply {
+public:
+    void refuse(ReplyCode code) {
+        text = R"({"code":)" + std::to_string(code);
+    }
+
+    /** The text, to which the value of that member is to be added. */
+    std::string& with(const char* name) {
+        text.reserve(ROOM_FOR_A_JOB);
+        return text.append(R"(,")").append(name).append(R"(":)");
+    }
+
+    std::string finish() {
+        return std::move(text += '}');
+    }
+
+private:
+    static constexpr std::size_t ROOM_FOR_A_JOB = 512;
+
+    std::string text = R"({"code":)" + std::to_string(CODE_OK);
+};
 
 /** The id that a request names; 0, which is no job's, if it names none. */
 int requestedJobId(const Json::Value& request) {
@@ -52,32 +81,32 @@ bool readCandidate(const Json::Value& request, Job& job) {
     return true;
 }
 
-void handleJobEnqueue(const Json::Value& request, Json::Value& reply, CommandServer*) {
+void handleJobEnqueue(const Json::Value& request, Reply& reply, CommandServer*) {
     Job job;
     if (!readCandidate(request, job)) {
-        return refuse(reply, CODE_BAD_REQUEST);
+        return reply.refuse(CODE_BAD_REQUEST);
     }
     const std::string queueName = action2str(job.getAction());
     BackendManager backend;
     if (!backend.load(job.getBackend(), queueName)) {
         queueLog(LOG_ERR, "backend [%s] not support", job.getBackend().c_str());
-        return refuse(reply, CODE_NOT_SUPPORTED);
+        return reply.refuse(CODE_NOT_SUPPORTED);
     }
     if (!backend.check(job)) {
         queueLog(LOG_ERR, "invalid job");
-        return refuse(reply, CODE_BAD_REQUEST);
+        return reply.refuse(CODE_BAD_REQUEST);
     }
     if (backend.getUniqueFormat().empty()) {
         queueLog(LOG_ERR, "backend [%s] bad unique", job.getBackend().c_str());
-        return refuse(reply, CODE_NOT_SUPPORTED);
+        return reply.refuse(CODE_NOT_SUPPORTED);
     }
     if (!queue_is_empty(action2str(Job::ACTION_RESTORE))) {
         queueLog(LOG_ERR, "restore queue is not empty");
-        return refuse(reply, CODE_RESTORE_PENDING);
+        return reply.refuse(CODE_RESTORE_PENDING);
     }
     if (System::isRestoreRunningNotQueued("")) {
         queueLog(LOG_ERR, "restore job running");
-        return refuse(reply, CODE_RESTORE_PENDING);
+        return reply.refuse(CODE_RESTORE_PENDING);
     }
     // A job refused from here on leaves a gap in the ids, so that no id is ever
     // seen on two jobs.
@@ -86,41 +115,42 @@ void handleJobEnqueue(const Json::Value& request, Json::Value& reply, CommandSer
     job.setUniqueString(backend.getJobUnique(job));
     if (queue_is_same_unique(job)) {
         queueLog(LOG_ERR, "job unique conflict [%s]", job.getUniqueString().c_str());
-        return refuse(reply, CODE_CONFLICT);
+        return reply.refuse(CODE_CONFLICT);
     }
-    queueLog(LOG_INFO, "enqueue job [%s]", job.toString().c_str());
+    const std::string admitted = job.toString();
+    queueLog(LOG_INFO, "enqueue job [%s]", admitted.c_str());
     jobQueues[queueName].push_back(job);
     queue_scan_next_to_launch();
-    reply[Member::JOB] = job.toJson();
+    reply.with(Member::JOB) += admitted;
 }
 
 // job_get
 
-void handleJobGet(const Json::Value& request, Json::Value& reply, CommandServer*) {
+void handleJobGet(const Json::Value& request, Reply& reply, CommandServer*) {
     const int id = requestedJobId(request);
     if (id == 0) {
-        refuse(reply, CODE_BAD_REQUEST);
+        reply.refuse(CODE_BAD_REQUEST);
         queueLog(LOG_ERR, "bad job get request");
         return;
     }
     const Job* const job = queue_find_job(id);
     if (job == nullptr || job->getStatus() == Job::STATUS_NONE) {
-        return refuse(reply, CODE_NOT_FOUND);
+        return reply.refuse(CODE_NOT_FOUND);
     }
-    reply[Member::JOB] = job->toJson();
+    recordOf(*job).appendTo(reply.with(Member::JOB));
 }
 
 // job_remove
 
-void handleJobRemove(const Json::Value& request, Json::Value& reply, CommandServer*) {
+void handleJobRemove(const Json::Value& request, Reply& reply, CommandServer*) {
     const int id = requestedJobId(request);
     if (id == 0) {
         queueLog(LOG_ERR, "bad job remove request");
-        return refuse(reply, CODE_BAD_REQUEST);
+        return reply.refuse(CODE_BAD_REQUEST);
     }
     queueLog(LOG_INFO, "remove job [%d]", id);
     if (!queue_visit_job(id, sendSignalCb, nullptr)) {
-        refuse(reply, CODE_NOT_FOUND);
+        reply.refuse(CODE_NOT_FOUND);
     }
 }
 
@@ -135,7 +165,7 @@ struct ListFilter {
     std::string target;
 
     bool takes(const Job& job) const {
-        return (backend.empty() || backend == job.getBackend()) &&
+        return (backend.empty() || backend == recordOf(job).backend) &&
                (format.empty() || target.empty() || job.toFormatString(format) == target);
     }
 };
@@ -193,32 +223,34 @@ const char* readFilter(const Json::Value& request, ListFilter& filter) {
     return nullptr;
 }
 
-void listAll(const JobQueue& queue, const ListFilter& filter, Json::Value& jobs) {
+/** Adds a job to the text of an array that has been opened. */
+void listJob(const Job& job, std::string& jobs) {
+    if (jobs.back() != '[') {
+        jobs += ',';
+    }
+    recordOf(job).appendTo(jobs);
+}
+
+void listAll(const JobQueue& queue, const ListFilter& filter, std::string& jobs) {
     for (const Job& job : queue) {
         if (filter.takes(job)) {
-            jobs.append(job.toJson());
+            listJob(job, jobs);
         }
     }
 }
 
 /** A list by unique string ends at the first job that passes. Whether there was one. */
-bool listFirst(const JobQueue& queue, const ListFilter& filter, Json::Value& jobs) {
+bool listFirst(const JobQueue& queue, const ListFilter& filter, std::string& jobs) {
     for (const Job* const job : queue.withUnique(filter.unique)) {
         if (filter.takes(*job)) {
-            jobs.append(job->toJson());
+            listJob(*job, jobs);
             return true;
         }
     }
     return false;
 }
 
-void handleJobList(const Json::Value& request, Json::Value& reply, CommandServer*) {
-    ListFilter filter;
-    if (const char* bad = readFilter(request, filter)) {
-        queueLog(LOG_ERR, "bad list param: %s", bad);
-        return refuse(reply, CODE_BAD_REQUEST);
-    }
-    Json::Value& jobs = reply[Member::JOBS] = Json::Value(Json::arrayValue);
+void listQueues(const ListFilter& filter, std::string& jobs) {
     for (const std::string& name : filter.queueNames) {
         const JobQueue& queue = jobQueues[name];
         if (filter.unique.empty()) {
@@ -227,6 +259,17 @@ void handleJobList(const Json::Value& request, Json::Value& reply, CommandServer
             return;
         }
     }
+}
+
+void handleJobList(const Json::Value& request, Reply& reply, CommandServer*) {
+    ListFilter filter;
+    if (const char* bad = readFilter(request, filter)) {
+        queueLog(LOG_ERR, "bad list param: %s", bad);
+        return reply.refuse(CODE_BAD_REQUEST);
+    }
+    std::string& jobs = reply.with(Member::JOBS) += '[';
+    listQueues(filter, jobs);
+    jobs += ']';
 }
 
 // clean_session
@@ -253,11 +296,11 @@ bool readLifetime(const Json::Value& request, long& lifetime) {
     return true;
 }
 
-void handleCleanSession(const Json::Value& request, Json::Value& reply, CommandServer* server) {
+void handleCleanSession(const Json::Value& request, Reply& reply, CommandServer* server) {
     std::string id;
     long lifetime = 0;
     if (!readSessionId(request, id) || !readLifetime(request, lifetime)) {
-        refuse(reply, CODE_BAD_REQUEST);
+        reply.refuse(CODE_BAD_REQUEST);
         queueLog(LOG_ERR, "get bad sessin clean job request");
         return;
     }
@@ -265,18 +308,18 @@ void handleCleanSession(const Json::Value& request, Json::Value& reply, CommandS
     if (!server->setTimeout(cleanSessionTimeout, delayOfSeconds(lifetime), context)) {
         // The timer that could not be added may hold on to the context, which
         // is left alone.
-        refuse(reply, CODE_INTERNAL);
+        reply.refuse(CODE_INTERNAL);
         queueLog(LOG_ERR, "failed to setTimeout for clean session job");
         return;
     }
-    reply[Member::SESSION_ID] = id;
+    appendJsonString(reply.with(Member::SESSION_ID), id);
 }
 
 // Dispatch
 
 struct OpHandler {
     const char* op;
-    void (*handle)(const Json::Value& request, Json::Value& reply, CommandServer* server);
+    void (*handle)(const Json::Value& request, Reply& reply, CommandServer* server);
 };
 
 // clang-format off
@@ -298,33 +341,32 @@ const OpHandler* findHandler(const std::string& op) {
     return nullptr;
 }
 
-void answer(const std::string& text, Json::Value& reply, CommandServer* server) {
+void answer(std::string_view text, Reply& reply, CommandServer* server) {
     Json::Value request;
     const bool parsed = fromString(text, request);
     const Json::Value& op = member(request, Member::OP);
     if (!parsed || !op.isString()) {
-        queueLog(LOG_ERR, "bad command: [%s]", text.c_str());
-        return refuse(reply, CODE_BAD_REQUEST);
+        queueLog(LOG_ERR, "bad command: [%s]", std::string(text).c_str());
+        return reply.refuse(CODE_BAD_REQUEST);
     }
     const OpHandler* const handler = findHandler(op.asString());
     if (handler == nullptr) {
         queueLog(LOG_ERR, "handler [%s] not found", op.asCString());
-        return refuse(reply, CODE_UNKNOWN_OP);
+        return reply.refuse(CODE_UNKNOWN_OP);
     }
     handler->handle(request, reply, server);
-    if (!reply.isMember(Member::CODE)) {
-        reply[Member::CODE] = CODE_OK;
-    }
 }
 
 } // namespace
 
 std::string dispatchRequest(const char* data, unsigned int length, CommandServer* server) {
-    const std::string text(data, length);
-    queueLog(LOG_DEBUG, "request [%s]", text.c_str());
-    Json::Value reply;
+    const std::string_view text(data, length);
+    if (queueDebugEnabled) {
+        queueLog(LOG_DEBUG, "request [%s]", std::string(text).c_str());
+    }
+    Reply reply;
     answer(text, reply, server);
-    return toString(reply);
+    return reply.finish();
 }
 
 } // namespace Backup
