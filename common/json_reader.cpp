@@ -184,7 +184,7 @@ private:
     /** Passes over bytes that stand for themselves; the first of them. */
     const char* skipPlain() {
         const char* const start = at;
-        at = std::find_if_not(at, end, standsForItself);
+        at = behindPlainBytes(at, end);
         return start;
     }
 

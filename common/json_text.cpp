@@ -78,11 +78,12 @@ void appendObject(std::string& out, const Json::Value& object) {
 
 void appendJsonString(std::string& out, std::string_view text) {
     out += '"';
-    for (auto at = text.begin(); at != text.end();) {
-        const auto special = std::find_if_not(at, text.end(), standsForItself);
+    const char* const end = text.data() + text.size();
+    for (const char* at = text.data(); at != end;) {
+        const char* const special = behindPlainBytes(at, end);
         out.append(at, special);
         at = special;
-        if (at != text.end()) {
+        if (at != end) {
             appendEscape(out, *at++);
         }
     }

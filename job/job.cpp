@@ -1,5 +1,6 @@
 #include <marubackup/job.h>
 
+#include <cstddef>
 #include <ostream>
 #include <type_traits>
 
@@ -10,6 +11,9 @@ namespace MARU {
 namespace Backup {
 
 namespace {
+
+/** What the text of most jobs fits in. */
+const std::size_t ROOM_FOR_MOST = 512;
 
 /**
  * Hands out the members of the JSON form, in the order of their names, which is
@@ -64,6 +68,7 @@ void appendMember(std::string& out, const JobParams& params) {
 } // namespace
 
 void JobPrivate::appendTo(std::string& out) const {
+    out.reserve(out.size() + ROOM_FOR_MOST);
     char before = '{';
     forEachMember(*this, [&](const char* name, const auto& member) {
         out += before;
