@@ -2,10 +2,13 @@
 
 #include <dirent.h>
 #include <fcntl.h>
+#include <pthread.h>
 #include <signal.h>
 #include <spawn.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
+#include <sys/uio.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -14,12 +17,12 @@
 #include <cstdlib>
 #include <cstring>
 #include <map>
-#include <memory>
 #include <optional>
 #include <vector>
 
 #include <marubackup-util/path.h>
 
+#include "descriptor.h"
 #include "shared/spawn_plan.h"
 
 namespace MARU {
@@ -40,6 +43,7 @@ const int OUTPUT_FLAGS = O_WRONLY | O_CREAT | O_APPEND | O_NOCTTY;
 const mode_t OUTPUT_MODE = 0640;
 
 const std::size_t MAX_SHOWN = 200;
+const int EXIT_NOT_RUN = 127;
 
 /** The start of `text` on one line: what a client has put into a name cannot look like a line of its own. */
 std::string shown(const std::string& text) {
@@ -47,15 +51,6 @@ std::string shown(const std::string& text) {
     std::replace_if(
         line.begin(), line.end(), [](char c) { return static_cast<unsigned char>(c) < ' ' || c == '\x7f'; }, '?');
     return line.size() < text.size() ? line + "..." : line;
-}
-
-/** Writes why a program does not run to `descriptor`, if that is open; leaves errno alone. */
-void report(int descriptor, const SubProcessPrivate& d, const std::string& reason) {
-    const int error = errno;
-    const std::string name = d.argv.empty() ? std::string() : d.argv.front();
-    const std::string line = "cannot run [" + shown(name) + "]: " + reason + "\n";
-    [[maybe_unused]] const ssize_t result = write(descriptor, line.data(), line.size());
-    errno = error;
 }
 
 bool hasNul(const std::string& text) {
@@ -147,32 +142,59 @@ std::vector<char*> pointersTo(const Texts& texts) {
 /** What execve() takes for a SubProcess, which must outlive it. */
 class Program {
 public:
-    explicit Program(const SubProcessPrivate& d) : argv(pointersTo(d.argv)) {
-        if (const char* const part = malformedPart(d)) {
-            errno = EINVAL;
-            report(STDERR_FILENO, d, part);
+    explicit Program(const SubProcessPrivate& d)
+        : argv(pointersTo(d.argv)), reportStart("cannot run [" + shown(d.argv.empty() ? "" : d.argv.front()) + "]: ") {
+        problem = malformedPart(d);
+        if (problem) {
+            error = EINVAL;
             return;
         }
-        variables = mergedEnvironment(d.additions);
-        envp = pointersTo(variables);
         path = findProgram(d.argv.front());
         if (path.empty()) {
-            report(STDERR_FILENO, d, std::strerror(errno));
+            error = errno;
+            problem = std::strerror(error);
+            return;
+        }
+        if (!d.additions.empty()) {
+            variables = mergedEnvironment(d.additions);
+            mergedEnvp = pointersTo(variables);
         }
     }
 
-    /** False, reported, and with errno set just after the construction, if there is none to run. */
-    bool isFound() const {
-        return !path.empty();
+    /** The program's environment; the caller's own if nothing is added to it. */
+    char* const* envp() const {
+        return mergedEnvp.empty() ? environ : mergedEnvp.data();
+    }
+
+    /** Writes to `descriptor`, if that is open, why the program does not run; leaves errno alone. Allocates nothing. */
+    void report(int descriptor, const char* reason) const {
+        const int callersErrno = errno;
+        const iovec line[] = {partOf(reportStart.c_str()), partOf(reason), partOf("\n")};
+        [[maybe_unused]] const ssize_t result = writev(descriptor, line, 3);
+        errno = callersErrno;
     }
 
     std::string path;
     std::vector<char*> argv;
-    std::vector<char*> envp;
+    const char* problem = nullptr; ///< why there is none to run; null if there is
+    int error = 0;                 ///< the same as an error number
 
 private:
+    static iovec partOf(const char* text) {
+        return {const_cast<char*>(text), std::strlen(text)};
+    }
+
+    std::string reportStart;
     std::vector<std::string> variables;
+    std::vector<char*> mergedEnvp;
 };
+
+/** Reports why there is none to run, and sets errno; -1. */
+int reportMissing(const Program& program) {
+    program.report(STDERR_FILENO, program.problem);
+    errno = program.error;
+    return -1;
+}
 
 /** Has the program write to that file; 0, or an error number. */
 int openFile(SpawnPlan& plan, int descriptor, const std::string& path) {
@@ -202,7 +224,7 @@ int spawn(const SubProcessPrivate& d, const Program& program, pid_t& child) {
     }
     if (error == 0) {
         error = posix_spawn(&child, program.path.c_str(), &plan.actions, &plan.attributes, program.argv.data(),
-                            program.envp.data());
+                            program.envp());
     }
     return error;
 }
@@ -218,55 +240,146 @@ void resetSignalDispositions() {
     }
 }
 
-/** Makes `descriptor` append to the file `path`; false, with errno set, if it cannot be opened. */
-bool openOutput(int descriptor, const std::string& path) {
-    const int opened = open(path.c_str(), OUTPUT_FLAGS, OUTPUT_MODE);
-    if (opened < 0 || opened == descriptor) {
-        return opened == descriptor;
+/** Whether opening an output file may wait, as for the reader of a FIFO. */
+enum class Opening { MAY_WAIT, AT_ONCE };
+
+/** Opens `path` as a descriptor from 3 up; it is not open, and errno is set, if that fails. */
+Descriptor openOutput(const std::string& path, Opening opening) {
+    const int atOnce = opening == Opening::AT_ONCE ? O_NONBLOCK : 0;
+    Descriptor opened(open(path.c_str(), OUTPUT_FLAGS | O_CLOEXEC | atOnce, OUTPUT_MODE));
+    if (opened.isOpen() && opened.get() < FIRST_OTHER_DESCRIPTOR) {
+        // The caller lacks a standard stream, whose place it has taken.
+        opened = Descriptor(fcntl(opened.get(), F_DUPFD_CLOEXEC, FIRST_OTHER_DESCRIPTOR));
     }
-    const bool done = dup2(opened, descriptor) == descriptor;
-    const int problem = errno;
-    close(opened);
-    errno = problem;
-    return done;
+    if (opened.isOpen() && atOnce) {
+        fcntl(opened.get(), F_SETFL, O_APPEND); // writing may wait in any case
+    }
+    return opened;
 }
 
-/** Puts the output files in place; the one that cannot be opened, with errno set, or null. */
-const std::string* redirectOutput(const SubProcessPrivate& d) {
-    if (d.stdOutput && !openOutput(STDOUT_FILENO, *d.stdOutput)) {
-        return &*d.stdOutput;
-    }
-    if (!d.stdError) {
-        return nullptr;
-    }
-    const bool done = d.stdError == d.stdOutput ? dup2(STDOUT_FILENO, STDERR_FILENO) == STDERR_FILENO
-                                                : openOutput(STDERR_FILENO, *d.stdError);
-    return done ? nullptr : &*d.stdError;
-}
-
-/** Keeps every descriptor but 0, 1 and 2 from the next program; false, with errno set, if that fails. */
-bool markCloseOnExec() {
-    if (close_range(FIRST_OTHER_DESCRIPTOR, ~0U, CLOSE_RANGE_CLOEXEC) == 0) {
-        return true;
-    }
-    // A kernel older than 5.11, or a filter of system calls that does not know it.
-    const std::unique_ptr<DIR, int (*)(DIR*)> folder(opendir("/proc/self/fd"), closedir);
-    if (!folder) {
-        return false;
-    }
-    while (const dirent* entry = readdir(folder.get())) {
-        const int descriptor = std::atoi(entry->d_name); // 0 for the two dot entries
-        if (descriptor >= FIRST_OTHER_DESCRIPTOR && fcntl(descriptor, F_SETFD, FD_CLOEXEC) != 0) {
-            return false;
+/** The open output files of a SubProcess, which must outlive this. */
+class Outputs {
+public:
+    Outputs(const SubProcessPrivate& d, Opening opening) : errorsJoinOutput(d.stdError && d.stdError == d.stdOutput) {
+        open(d.stdOutput, opening, output);
+        if (!errorsJoinOutput && !unopened) {
+            open(d.stdError, opening, errors);
         }
     }
-    return true;
+
+    /** Makes them the process' standard streams, by system calls alone; false, with errno set, if that fails. */
+    bool putInPlace() const {
+        if (output.isOpen() && dup2(output.get(), STDOUT_FILENO) < 0) {
+            return false;
+        }
+        const int forErrors = errorsJoinOutput ? STDOUT_FILENO : errors.get();
+        return forErrors < 0 || dup2(forErrors, STDERR_FILENO) >= 0;
+    }
+
+    const std::string* unopened = nullptr; ///< the first that cannot be opened, errno being set just afterwards
+
+private:
+    void open(const std::optional<std::string>& path, Opening opening, Descriptor& descriptor) {
+        if (path) {
+            descriptor = openOutput(*path, opening);
+            unopened = descriptor.isOpen() ? nullptr : &*path;
+        }
+    }
+
+    const bool errorsJoinOutput;
+    Descriptor output;
+    Descriptor errors;
+};
+
+/** The same where the kernel is older than 5.11, or a filter of system calls does not know close_range(). */
+bool markOneByOne() {
+    const Descriptor folder(open("/proc/self/fd", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    alignas(dirent64) char entries[1024];
+    ssize_t got = -1;
+    while (folder.isOpen() && (got = getdents64(folder.get(), entries, sizeof entries)) > 0) {
+        const dirent64* entry = nullptr;
+        for (const char* at = entries; at < entries + got; at += entry->d_reclen) {
+            entry = reinterpret_cast<const dirent64*>(at);
+            const int descriptor = std::atoi(entry->d_name); // 0 for the two dot entries
+            if (descriptor >= FIRST_OTHER_DESCRIPTOR && fcntl(descriptor, F_SETFD, FD_CLOEXEC) != 0) {
+                return false;
+            }
+        }
+    }
+    return got == 0;
+}
+
+/**
+ * Keeps every descriptor but 0, 1 and 2 from the next program, by system calls
+ * alone; false, with errno set, if that fails.
+ */
+bool markCloseOnExec() {
+    return close_range(FIRST_OTHER_DESCRIPTOR, ~0U, CLOSE_RANGE_CLOEXEC) == 0 || markOneByOne();
 }
 
 void emptySignalMask() {
     sigset_t none;
     sigemptyset(&none);
     sigprocmask(SIG_SETMASK, &none, nullptr);
+}
+
+/** What the program does not share with its caller whatever it is. */
+void leaveCaller() {
+    resetSignalDispositions();
+    setpgid(0, 0);
+}
+
+/** Becomes the program, by system calls alone. Returns only if that fails: reported, and with errno set. */
+void becomeProgram(const Program& program, const Outputs& outputs) {
+    // Where the caller reports, also when the program's errors have a file of their own.
+    const int reports = fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, FIRST_OTHER_DESCRIPTOR);
+    if (outputs.putInPlace() && markCloseOnExec()) {
+        // Last, so that a signal held back until now finds the defaults in place.
+        emptySignalMask();
+        execve(program.path.c_str(), program.argv.data(), program.envp());
+    }
+    const int error = errno;
+    program.report(reports, std::strerror(error));
+    close(reports);
+    errno = error;
+}
+
+/** The mask of the calling thread, from which all signals are held back while this lives. */
+class HeldSignals {
+public:
+    HeldSignals() {
+        sigset_t all;
+        sigfillset(&all);
+        pthread_sigmask(SIG_SETMASK, &all, &old);
+    }
+    ~HeldSignals() {
+        pthread_sigmask(SIG_SETMASK, &old, nullptr);
+    }
+    HeldSignals(const HeldSignals&) = delete;
+    HeldSignals& operator=(const HeldSignals&) = delete;
+
+private:
+    sigset_t old;
+};
+
+/** The life of a child in its caller's memory, of which it changes nothing but its own frames and errno. */
+[[noreturn, gnu::noinline]] void liveInCallersMemory(const Program& program, const Outputs& outputs, int priority) {
+    leaveCaller();
+    setpriority(PRIO_PROCESS, 0, priority);
+    becomeProgram(program, outputs);
+    _exit(EXIT_NOT_RUN);
+}
+
+/**
+ * A function of its own, since the child runs on this frame until it has one
+ * below: nothing that the caller still needs may be kept in it.
+ */
+[[gnu::noinline]] pid_t startInCallersMemory(const Program& program, const Outputs& outputs, int priority) {
+    const pid_t child = vfork();
+    if (child == 0) {
+        liveInCallersMemory(program, outputs, priority);
+    }
+    return child;
 }
 
 } // namespace
@@ -293,14 +406,14 @@ void SubProcess::setStdError(const std::string& path, int /*reserved*/) {
 
 int SubProcess::call() const {
     const Program program(*d);
-    if (!program.isFound()) {
-        return -1;
+    if (program.problem) {
+        return reportMissing(program);
     }
     pid_t child = -1;
     const int error = spawn(*d, program, child);
     if (error != 0) {
+        program.report(STDERR_FILENO, std::strerror(error));
         errno = error;
-        report(STDERR_FILENO, *d, std::strerror(error));
         return -1;
     }
     int status = 0;
@@ -314,24 +427,35 @@ int SubProcess::call() const {
 
 int SubProcess::exec() const {
     const Program program(*d);
-    if (!program.isFound()) {
+    if (program.problem) {
+        return reportMissing(program);
+    }
+    leaveCaller();
+    const Outputs outputs(*d, Opening::MAY_WAIT);
+    if (outputs.unopened) {
+        const int error = errno;
+        const std::string reason = "its output file [" + shown(*outputs.unopened) + "]: " + std::strerror(error);
+        program.report(STDERR_FILENO, reason.c_str());
+        errno = error;
         return -1;
     }
-    // Where the caller reports, also when the program's errors have a file of their own.
-    const int reports = fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, FIRST_OTHER_DESCRIPTOR);
-    resetSignalDispositions();
-    setpgid(0, 0);
-    const std::string* const unopened = redirectOutput(*d);
-    if (!unopened && markCloseOnExec()) {
-        // Last, so that a signal held back until now finds the defaults in place.
-        emptySignalMask();
-        execve(program.path.c_str(), program.argv.data(), program.envp.data());
-    }
-    const int error = errno;
-    report(reports, *d, (unopened ? "its output file [" + shown(*unopened) + "]: " : "") + std::strerror(error));
-    close(reports);
-    errno = error;
+    becomeProgram(program, outputs);
     return -1;
+}
+
+int SubProcess::start(int priority) const {
+    const int callersErrno = errno;
+    pid_t child = -1;
+    const Program program(*d);
+    if (!program.problem) {
+        const Outputs outputs(*d, Opening::AT_ONCE);
+        if (!outputs.unopened) {
+            const HeldSignals held;
+            child = startInCallersMemory(program, outputs, priority);
+        }
+    }
+    errno = callersErrno;
+    return child;
 }
 
 } // namespace Backup

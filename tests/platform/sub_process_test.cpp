@@ -1,8 +1,10 @@
 #include <marubackup-util/sub_process.h>
 
 #include <fcntl.h>
+#include <malloc.h>
 #include <pthread.h>
 #include <signal.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/time.h>
@@ -17,10 +19,13 @@
 
 #include "support/emulation.h"
 #include "support/files.h"
+#include "support/gate.h"
 #include "support/in_child.h"
 #include "support/signals.h"
 #include "support/syscall_filter.h"
 #include "support/temp_dir.h"
+#include "support/vfork.h"
+#include "support/waiting.h"
 
 using MARU::Backup::SubProcess;
 using support::describeStatus;
@@ -31,7 +36,8 @@ using support::writeFile;
 
 namespace {
 
-enum class Way { CALL, EXEC };
+enum class Way { CALL, EXEC, START };
+const char* const WAY_NAMES[] = {"Call", "Exec", "Start"};
 
 /** What a caller reports of a program that it called, or could not replace itself with. */
 struct Result {
@@ -39,7 +45,7 @@ struct Result {
     int error;
 };
 
-/** The tests of it hold for call() and for exec() alike. */
+/** The tests of it hold for call(), exec() and start() alike. */
 class ARunProgram : public testing::TestWithParam<Way> {
 protected:
     using Preparation = std::function<void()>;
@@ -56,7 +62,7 @@ protected:
         const int callerStatus = runInChild([&] {
             setenv("PATH", "/usr/bin:/bin", 1);
             prepare();
-            const int status = GetParam() == Way::CALL ? process.call() : process.exec();
+            const int status = run(process);
             const Result result = {status, errno};
             return write(report[1], &result, sizeof result) == sizeof result ? 0 : 1;
         });
@@ -85,15 +91,32 @@ protected:
         return program;
     }
 
+    /** What outcome() says of a program that the kernel does not take. */
+    static std::string refusal(const std::string& reason) {
+        return GetParam() == Way::START ? "exit 127" : "failed: " + reason;
+    }
+
     const TempDir dir;
     const std::string out = dir.path("out");
     const std::string err = dir.path("err");
+
+private:
+    static int run(const SubProcess& process) {
+        switch (GetParam()) {
+        case Way::CALL:
+            return process.call();
+        case Way::START: {
+            const pid_t child = process.start(0);
+            return child < 0 ? process.exec() : support::waitForChild(child);
+        }
+        default:
+            return process.exec();
+        }
+    }
 };
 
-INSTANTIATE_TEST_SUITE_P(SubProcess, ARunProgram, testing::Values(Way::CALL, Way::EXEC),
-                         [](const testing::TestParamInfo<Way>& way) {
-                             return way.param == Way::CALL ? "Call" : "Exec";
-                         });
+INSTANTIATE_TEST_SUITE_P(SubProcess, ARunProgram, testing::Values(Way::CALL, Way::EXEC, Way::START),
+                         [](const testing::TestParamInfo<Way>& way) { return WAY_NAMES[static_cast<int>(way.param)]; });
 
 std::list<std::string> shell(const std::string& script) {
     return {"/bin/sh", "-c", script};
@@ -169,9 +192,9 @@ TEST_P(ARunProgram, MustBeThere) {
     if (GetParam() == Way::CALL) {
         SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     }
-    EXPECT_EQ("failed: No such file or directory", outcome(SubProcess({dir.path("missing")})));
+    EXPECT_EQ(refusal("No such file or directory"), outcome(SubProcess({dir.path("missing")})));
     EXPECT_EQ("failed: No such file or directory", outcome(SubProcess({"marubackup-test-no-such-program"})));
-    EXPECT_EQ("failed: Not a directory", outcome(SubProcess({"/dev/null/program"})));
+    EXPECT_EQ(refusal("Not a directory"), outcome(SubProcess({"/dev/null/program"})));
 }
 
 TEST_P(ARunProgram, MustBeAnExecutableFile) {
@@ -181,8 +204,8 @@ TEST_P(ARunProgram, MustBeAnExecutableFile) {
     const std::string plain = dir.path("plain");
     writeFile(plain, "#!/bin/sh\n", 0644);
 
-    EXPECT_EQ("failed: Permission denied", outcome(SubProcess({plain})));
-    EXPECT_EQ("failed: Permission denied", outcome(SubProcess({dir.path()})));
+    EXPECT_EQ(refusal("Permission denied"), outcome(SubProcess({plain})));
+    EXPECT_EQ(refusal("Permission denied"), outcome(SubProcess({dir.path()})));
 }
 
 TEST_P(ARunProgram, MayBeAScriptThatNamesItsInterpreter) {
@@ -198,15 +221,15 @@ TEST_P(ARunProgram, IsNotHandedToAShellIfItIsNoProgram) {
     writeFile(dir.path("script"), "exit 0\n", 0755);
     const auto searchThere = [this] { setenv("PATH", dir.path().c_str(), 1); };
 
-    EXPECT_EQ("failed: Exec format error", outcome(SubProcess({dir.path("script")})));
-    EXPECT_EQ("failed: Exec format error", outcome(SubProcess({"script"}), searchThere));
+    EXPECT_EQ(refusal("Exec format error"), outcome(SubProcess({dir.path("script")})));
+    EXPECT_EQ(refusal("Exec format error"), outcome(SubProcess({"script"}), searchThere));
 }
 
 TEST_P(ARunProgram, IsRefusedIfItsArgumentsAreTooLong) {
     if (GetParam() == Way::CALL) {
         SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     }
-    EXPECT_EQ("failed: Argument list too long", outcome(SubProcess({"true", std::string(16 * 1024 * 1024, 'x')})));
+    EXPECT_EQ(refusal("Argument list too long"), outcome(SubProcess({"true", std::string(16 * 1024 * 1024, 'x')})));
 }
 
 TEST_P(ARunProgram, IsRefusedIfATextCannotReachTheKernelWhole) {
@@ -625,6 +648,138 @@ TEST(ACaller, LeavesNoChildAndNoDescriptorBehind) {
     });
 
     EXPECT_EQ("exit 0", describeStatus(status));
+}
+
+// What start() alone promises.
+
+namespace {
+
+/** Enough to tell what each leaves behind from what the heap keeps for later. */
+const int ROUNDS = 500;
+const std::size_t SMALLEST_BLOCK = 16;
+
+} // namespace
+
+TEST(AStartedProgram, RunsBesideItsCallerAtThatNiceValue) {
+    const TempDir dir;
+    support::Gate gate(dir.path("gate"));
+    SubProcess process(shell("read line < " + gate.path() + "; nice"));
+    process.setStdOutput(dir.path("out"), 0);
+
+    const pid_t child = process.start(7);
+
+    ASSERT_GT(child, 0);
+    gate.open();
+    EXPECT_EQ("exit 0", describeStatus(support::waitForChild(child)));
+    EXPECT_EQ("7\n", readFile(dir.path("out")));
+    EXPECT_EQ(0, getpriority(PRIO_PROCESS, 0));
+}
+
+#ifndef VFORK_IS_FORK
+TEST(AStartedProgram, CostsNoCopyOfItsCallersMemory) {
+    const int status = runInChild([] {
+        pthread_atfork([] { forked = true; }, nullptr, nullptr);
+        const pid_t child = SubProcess({"true"}).start(0);
+        return child > 0 && support::waitForChild(child) == 0 && !forked ? 0 : 1;
+    });
+
+    EXPECT_EQ("exit 0", describeStatus(status));
+}
+#endif
+
+TEST(AStartedProgram, LeavesNoMemoryAndNoDescriptorBehind) {
+    const TempDir dir;
+    SubProcess process({"true", std::string(1000, 'x')});
+    process.setEnv("NAME", "value");
+    process.setStdOutput(dir.path("out"), 0);
+    process.setStdError(dir.path("err"), 0);
+    const auto run = [&] { EXPECT_EQ("exit 0", describeStatus(support::waitForChild(process.start(0)))); };
+    run();
+    const std::size_t before = mallinfo2().uordblks;
+    const int descriptors = support::openDescriptors(getpid());
+
+    for (int round = 0; round < ROUNDS && !testing::Test::HasFailure(); ++round) {
+        run();
+    }
+
+    EXPECT_LT(mallinfo2().uordblks, before + ROUNDS * SMALLEST_BLOCK) << "every round leaves some";
+    EXPECT_EQ(descriptors, support::openDescriptors(getpid()));
+}
+
+TEST(AStartedProgram, LeavesItsCallersSignalsErrnoAndStreamsAlone) {
+    const TempDir dir;
+    const int status = runInChild([&] {
+        support::changeAllSignals();
+        openMoreDescriptors();
+        const std::string before = readFile("/proc/self/status");
+        SubProcess process({"true"});
+        process.setStdOutput(dir.path("out"), 0);
+        errno = EXDEV;
+        const pid_t child = process.start(0);
+        const int error = errno;
+        if (child < 0 || support::waitForChild(child) != 0 || error != EXDEV) {
+            return 1;
+        }
+        const std::string after = readFile("/proc/self/status");
+        for (const char* const label : {"SigBlk:", "SigIgn:", "SigCgt:"}) {
+            if (field(before, label) != field(after, label)) {
+                return 2;
+            }
+        }
+        const bool descriptorsKept = fcntl(200, F_GETFD) == 0 && write(STDOUT_FILENO, "", 0) == 0;
+        return descriptorsKept && getpgrp() != child ? 0 : 3;
+    });
+
+    EXPECT_EQ("exit 0", describeStatus(status));
+    EXPECT_EQ("", readFile(dir.path("out")));
+}
+
+TEST(AStartedProgram, WritesToAFifoThatIsRead) {
+    const TempDir dir;
+    const std::string fifo = dir.path("fifo");
+    ASSERT_EQ(0, mkfifo(fifo.c_str(), 0600));
+    const int reader = open(fifo.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+    SubProcess process(shell("cat /proc/self/fdinfo/1"));
+    process.setStdOutput(fifo, 0);
+
+    const pid_t child = process.start(0);
+
+    ASSERT_GT(child, 0);
+    EXPECT_EQ("exit 0", describeStatus(support::waitForChild(child)));
+    char text[256] = {};
+    EXPECT_GT(read(reader, text, sizeof text - 1), 0);
+    const unsigned long flags = std::stoul(field(text, "flags:"), nullptr, 8);
+    EXPECT_EQ(0U, flags & O_NONBLOCK) << "its writes do not wait";
+    close(reader);
+}
+
+TEST(ANotStartedProgram, IsOneThatExecWouldReportOrWaitFor) {
+    const TempDir dir;
+    const std::string fifo = dir.path("fifo");
+    const std::string report = dir.path("report");
+    ASSERT_EQ(0, mkfifo(fifo.c_str(), 0600));
+    SubProcess missing({"marubackup-test-no-such-program"});
+    SubProcess unreadFifo({"true"});
+    unreadFifo.setStdOutput(fifo, 0);
+    SubProcess unreadErrorFifo({"true"});
+    unreadErrorFifo.setStdError(fifo, 0);
+    SubProcess unopened({"true"});
+    unopened.setStdOutput(dir.path("missing/out"), 0);
+    SubProcess unnamed({});
+
+    const int status = runInChild([&] {
+        dup2(open(report.c_str(), O_WRONLY | O_CREAT, 0600), STDERR_FILENO);
+        errno = EXDEV;
+        for (const SubProcess* process : {&missing, &unreadFifo, &unreadErrorFifo, &unopened, &unnamed}) {
+            if (process->start(0) != -1 || errno != EXDEV) {
+                return 1;
+            }
+        }
+        return waitpid(-1, nullptr, WNOHANG) == -1 && errno == ECHILD ? 0 : 2;
+    });
+
+    EXPECT_EQ("exit 0", describeStatus(status));
+    EXPECT_EQ("", readFile(report));
 }
 
 // What exec() alone promises.

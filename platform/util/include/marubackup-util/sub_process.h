@@ -62,6 +62,23 @@ public:
      */
     int exec() const;
 
+    /**
+     * Starts the program in a child process at the nice value `priority`, and
+     * does not wait for its end; the child's process id. It does there what
+     * exec() does, up to the report of a program that the kernel does not take,
+     * after which the child exits with 127. The caller's memory is not
+     * duplicated: the child uses it, changing nothing, until it is the program,
+     * and the caller stands still for so long.
+     *
+     * Negative if that cannot be done: if no child can be made, or exec() would
+     * report something before it turns to the kernel, or an output file is one
+     * whose opening might wait. Nothing is reported, and exec() in a forked
+     * child is the way. errno is left alone.
+     *
+     * An appliance's own library may lack it.
+     */
+    int start(int priority) const;
+
 private:
     SubProcessPrivate* d;
 };
