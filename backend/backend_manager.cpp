@@ -7,6 +7,7 @@
 
 #include <cerrno>
 #include <memory>
+#include <new>
 
 #include <json/value.h>
 
@@ -15,6 +16,7 @@
 #include <marubackup-util/sub_process.h>
 #include <marubackup/job.h>
 
+#include "backend/start_launch.h"
 #include "common/json_text.h"
 #include "common/log.h"
 
@@ -78,6 +80,27 @@ bool applyBackendEnv(SubProcess& process, const OptionMap& options, const Job& j
         }
     }
     return true;
+}
+
+std::string launchKey(const Job& job) {
+    const std::string branch = job.getCommandBranch();
+    return "command_" + (branch.empty() ? "launch" : branch);
+}
+
+void applyOutputFiles(SubProcess& process, const OptionMap& options, const Job& job) {
+    std::string output;
+    if (options.optGet("pipe_stdout", output, false)) {
+        process.setStdOutput(job.toFormatString(output), 0);
+    }
+    if (options.optGet("pipe_stderr", output, false)) {
+        process.setStdError(job.toFormatString(output), 0);
+    }
+}
+
+int launchPriority(const OptionMap& options) {
+    int priority = DEFAULT_PRIORITY;
+    options.optGet("priority", priority);
+    return priority;
 }
 
 } // namespace
@@ -171,28 +194,46 @@ bool BackendManager::launch(const Job& job) const {
     if (!d->checkLoaded()) {
         return false;
     }
-    const std::string branch = job.getCommandBranch();
     std::list<std::string> command;
-    if (!d->options.optGet("command_" + (branch.empty() ? "launch" : branch), command)) {
+    if (!d->options.optGet(launchKey(job), command)) {
         LOG_LOCATED_ERR("wrong config: launch command not found");
         return false;
     }
     formatCommand(command, job);
     SubProcess process(command);
     applyBackendEnv(process, d->options, job);
-
-    std::string output;
-    if (d->options.optGet("pipe_stdout", output, false)) {
-        process.setStdOutput(job.toFormatString(output), 0);
-    }
-    if (d->options.optGet("pipe_stderr", output, false)) {
-        process.setStdError(job.toFormatString(output), 0);
-    }
-    int priority = DEFAULT_PRIORITY;
-    d->options.optGet("priority", priority);
-    setpriority(PRIO_PROCESS, static_cast<id_t>(getpid()), priority);
+    applyOutputFiles(process, d->options, job);
+    setpriority(PRIO_PROCESS, static_cast<id_t>(getpid()), launchPriority(d->options));
     return process.exec() != 0;
 }
+
+#ifdef MARUBACKUP_SUB_PROCESS_WITHOUT_START
+
+int startLaunch(const BackendManager&, const Job&) {
+    return -1;
+}
+
+#else
+
+int startLaunch(const BackendManager& backend, const Job& job) {
+    const OptionMap& options = backend.d->options;
+    std::list<std::string> command;
+    std::string environment;
+    if (!backend.d->loaded || !options.optGet(launchKey(job), command) ||
+        options.optGet("eviron", environment, false)) {
+        return -1; // launch() has, or may have, something to log
+    }
+    try {
+        formatCommand(command, job);
+        SubProcess process(command);
+        applyOutputFiles(process, options, job);
+        return process.start(launchPriority(options));
+    } catch (const std::bad_alloc&) {
+        return -1; // at worst that child's end, and never the caller's
+    }
+}
+
+#endif
 
 } // namespace Backup
 } // namespace MARU

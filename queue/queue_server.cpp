@@ -16,6 +16,7 @@
 #include <marubackup/job.h>
 #include <marubackup/timed_session.h>
 
+#include "backend/start_launch.h"
 #include "command/protocol.h"
 #include "common/log.h"
 #include "job/job_record.h"
@@ -76,6 +77,18 @@ namespace {
     _exit(EXIT_NOT_LAUNCHED);
 }
 
+/** A child that runs the job's command; negative, with errno set, if none can be made. */
+pid_t startCommand(const BackendManager& backend, const Job& job) {
+    pid_t pid = startLaunch(backend, job);
+    if (pid < 0) {
+        pid = forkWithDefaultSignals();
+        if (pid == 0) {
+            becomeCommand(backend, job);
+        }
+    }
+    return pid;
+}
+
 } // namespace
 
 bool do_launch_job(Job& job) {
@@ -85,13 +98,10 @@ bool do_launch_job(Job& job) {
         LOG_LOCATED_ERR("wrong backend [%s]", job.toString().c_str());
         return false;
     }
-    const pid_t pid = forkWithDefaultSignals();
+    const pid_t pid = startCommand(backend, job);
     if (pid < 0) {
         LOG_LOCATED_ERR("fork: %m");
         return false;
-    }
-    if (pid == 0) {
-        becomeCommand(backend, job);
     }
     job.setStatus(Job::STATUS_RUNNING);
     job.setPid(pid);

@@ -80,6 +80,8 @@ public:
     bool launch(const Job& job) const;
 
 private:
+    friend int startLaunch(const BackendManager& backend, const Job& job);
+
     BackendManagerPrivate* d;
 };
 

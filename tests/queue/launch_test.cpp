@@ -1,5 +1,8 @@
 #include "queue/queue_server.h"
 
+#include <malloc.h>
+#include <pthread.h>
+#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <syslog.h>
 #include <unistd.h>
@@ -7,6 +10,7 @@
 #include <cerrno>
 #include <csignal>
 #include <ostream>
+#include <vector>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -15,9 +19,11 @@
 #include "signals.h"
 #include "support/backend_files.h"
 #include "support/emulation.h"
+#include "support/files.h"
 #include "support/in_child.h"
 #include "support/named_rows.h"
 #include "support/syscall_filter.h"
+#include "support/vfork.h"
 
 using namespace MARU::Backup;
 using support::describeStatus;
@@ -28,7 +34,32 @@ using testing::IsEmpty;
 
 namespace {
 
-class Launch : public QueueTest {};
+bool forked = false;
+
+/** Enough to tell what each leaves behind from what the heap keeps for later. */
+const int ROUNDS = 500;
+const std::size_t SMALLEST_BLOCK = 16;
+
+class Launch : public QueueTest {
+protected:
+    /** Declares the backend "probe", whose command for every action is `lines`. */
+    static Job probe(const std::string& lines) {
+        support::writeLocalBackend("probe", inAllSections(lines));
+        return Job("probe", Job::ACTION_BACKUP);
+    }
+
+    /** Launches the job in a daemon of its own; "exit 1" if that daemon's memory was duplicated. */
+    static std::string launchedUnforked(const Job& job) {
+        return describeStatus(support::runInChild([&job] {
+            pthread_atfork([] { forked = true; }, nullptr, nullptr);
+            if (!launch(job)) {
+                return 2;
+            }
+            waitForChild(job.getPid());
+            return forked ? 1 : 0;
+        }));
+    }
+};
 
 /** A section that declares nothing that can be run. */
 struct Unrunnable {
@@ -40,6 +71,15 @@ struct Unrunnable {
     friend std::ostream& operator<<(std::ostream& out, const Unrunnable& row) {
         return out << row.name;
     }
+};
+
+/** What makes a process, by any of its names on the machine. */
+const std::vector<long> MAKE_A_PROCESS = {
+    SYS_clone,
+    SYS_clone3,
+#ifdef SYS_vfork
+    SYS_vfork,
+#endif
 };
 
 class UnrunnableCommand : public Launch, public testing::WithParamInterface<Unrunnable> {};
@@ -130,7 +170,7 @@ TEST_F(Launch, WithoutRoomForAProcessSaysWhy) {
     const std::string queued = job.toString();
 
     const pid_t daemon = support::startInChild([&job]() {
-        support::refuseSystemCalls({SYS_clone, SYS_clone3}, EAGAIN);
+        support::refuseSystemCalls(MAKE_A_PROCESS, EAGAIN);
         return !launch(job) && job.getStatus() == Job::STATUS_QUEUED && job.getPid() == -1 ? 0 : 1;
     });
 
@@ -145,7 +185,7 @@ TEST_F(Launch, WithoutRoomForAProcessDropsTheJob) {
     const std::string queued = job.toString();
 
     const pid_t daemon = support::startInChild([]() {
-        support::refuseSystemCalls({SYS_clone, SYS_clone3}, EAGAIN);
+        support::refuseSystemCalls(MAKE_A_PROCESS, EAGAIN);
         queue_scan_next_to_launch();
         return queue_is_empty("backup") ? 0 : 1;
     });
@@ -167,4 +207,102 @@ TEST_F(Launch, OfAJobThatIsRemovedAtOnceStartsAProcessThatDies) {
         EXPECT_EQ("signal 15", describeStatus(waitForChild(job.getPid()))) << "round " << round;
         jobQueues["backup"].clear();
     }
+}
+
+#ifndef VFORK_IS_FORK
+TEST_F(Launch, CostsNoCopyOfTheDaemonsMemory) {
+    EXPECT_EQ("exit 0", launchedUnforked(addScript(Job::ACTION_BACKUP, "exit 3")));
+    EXPECT_EQ("exit 0", launchedUnforked(add(probe("command_launch = /nonexistent/program"))));
+    EXPECT_EQ("exit 0", launchedUnforked(add(probe("command_launch = true\npipe_stdout = " + folder.path("out")))));
+}
+#endif
+
+TEST_F(Launch, ThatHasSomethingToLogLogsItUnderTheProcessOfTheJob) {
+    const Job& job = launched(add(probe("command_launch = true\neviron = {\"A\": \"1\"}")));
+
+    EXPECT_EQ("exit 0", describeStatus(waitForChild(job.getPid())));
+    expectLocated(log, LOG_ERR, job.getPid(), "backend_manager", "wrong config: bad env");
+}
+
+TEST_F(Launch, OfAProgramThatIsNotThereSaysSo) {
+    const Job& job = launched(add(probe("command_launch = /nonexistent/program")));
+
+    EXPECT_EQ("exit 127", describeStatus(waitForChild(job.getPid())));
+
+    EXPECT_THAT(diary.take(),
+                testing::Contains("cannot run [/nonexistent/program]: No such file or directory").Times(1));
+}
+
+TEST_F(Launch, DoesNotWaitForWhoeverReadsTheJobsOutput) {
+    const std::string fifo = folder.path("fifo");
+    ASSERT_EQ(0, mkfifo(fifo.c_str(), 0600));
+
+    const Job& job = launched(add(probe("command_launch = echo written\npipe_stdout = " + fifo)));
+
+    EXPECT_EQ("written\n", support::readFile(fifo));
+    EXPECT_EQ("exit 0", describeStatus(waitForChild(job.getPid())));
+}
+
+TEST_F(Launch, LeavesNothingOfItInTheDaemonsMemory) {
+    const Job& job = add(probe("command_launch = true {{text}}\npipe_stdout = " + folder.path("out")));
+    change(job, [](Job& queued) { queued.setParam("text", std::string(1000, 'x')); });
+    const auto launchOnce = [&] { EXPECT_EQ("exit 0", describeStatus(waitForChild(launched(job).getPid()))); };
+    launchOnce();
+    const std::size_t before = mallinfo2().uordblks;
+
+    for (int round = 0; round < ROUNDS && !HasFailure(); ++round) {
+        launchOnce();
+    }
+
+    EXPECT_LT(mallinfo2().uordblks, before + ROUNDS * SMALLEST_BLOCK) << "every round leaves some";
+}
+
+namespace {
+
+volatile sig_atomic_t handledHere = 0;
+volatile sig_atomic_t handledElsewhere = 0;
+pid_t daemonProcess = 0;
+
+void noteWhereHandled(int) {
+    ++(getpid() == daemonProcess ? handledHere : handledElsewhere);
+}
+
+/** Signals its process group, which is the daemon's, without a pause. */
+[[noreturn]] void signalTheGroup() {
+    signal(SIGUSR1, SIG_IGN);
+    while (kill(0, SIGUSR1) == 0) {
+    }
+    _exit(1);
+}
+
+} // namespace
+
+TEST_F(Launch, IsNotDisturbedBySignalsAndRunsNoHandlerInTheJobsProcess) {
+    const std::string outcomes = folder.path("outcomes");
+    const int status = support::runInChild([&] {
+        setpgid(0, 0);
+        daemonProcess = getpid();
+        signal(SIGUSR1, noteWhereHandled);
+        const pid_t sender = fork();
+        if (sender == 0) {
+            signalTheGroup();
+        }
+        std::string odd;
+        for (int round = 0; round < 100 || handledHere == 0; ++round) {
+            const std::string outcome =
+                describeStatus(waitForChild(launched(addScript(Job::ACTION_BACKUP, "exit 0")).getPid()));
+            // Until it leads a group of its own, the job's process is signalled as well.
+            if (outcome != "exit 0" && outcome != "signal " + std::to_string(SIGUSR1)) {
+                odd += outcome + "\n";
+            }
+            jobQueues.clear();
+        }
+        kill(sender, SIGKILL);
+        waitForChild(sender);
+        support::writeFile(outcomes, odd);
+        return handledElsewhere == 0 ? 0 : 1;
+    });
+
+    EXPECT_EQ("exit 0", describeStatus(status));
+    EXPECT_EQ("", support::readFile(outcomes));
 }
