@@ -181,6 +181,23 @@ TEST_F(CommandServerRequests, MayBeAnsweredWithMegabytesAndInOrder) {
     EXPECT_EQ("small again", peer.readFrame());
 }
 
+TEST_F(CommandServerRequests, WaitBehindAReplyThatIsNotReadYet) {
+    ServerProcess server(path, withHandler([](const char* payload, unsigned int length, CommandServer*) {
+                             report("request of " + std::to_string(length));
+                             return length == 1 ? std::string(3000000, *payload) : std::string(payload, length);
+                         }));
+    SocketPeer peer(path);
+
+    peer.write(frame("L"));
+    server.waitForReport("request of 1");
+    peer.write(frame("second"));
+    server.waitForReport("request of 6");
+
+    EXPECT_EQ(std::string(3000000, 'L'), peer.readFrame());
+    EXPECT_EQ("second", peer.readFrame());
+    EXPECT_EQ("again", peer.ask("again"));
+}
+
 TEST_F(CommandServerRequests, OfManyConnectionsAreAnsweredToTheirOwnSenders) {
     ServerProcess server(path);
     std::vector<std::unique_ptr<SocketPeer>> peers;
