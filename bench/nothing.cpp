@@ -1,0 +1,4 @@
+/** The least that a job can be. */
+int main() {
+    return 0;
+}
