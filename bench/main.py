@@ -1,82 +1,94 @@
-"""Chooses what to measure, has it measured in the sandbox, and makes table and plot of it."""
+"""Chooses what to measure, has it measured in the sandbox, and tells what came out."""
 
 import argparse
 import json
 import pathlib
 import re
-import statistics
 import subprocess
 import sys
 
+import report
 from measurements import MEASUREMENTS, ROWS
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent
 TOOLS = ROOT / "build" / "bench" / "bench"
+README = ROOT / "README.md"
+PERFORMANCE = ROOT / "docs" / "performance.md"
+PLOT = ROOT / "docs" / "performance.svg"
 ROUNDS = 11
 QUICK_ROUNDS = 3
-HEAD = ("what", "ours", "peer", "ratio", "to reach", "ok")
 
 
 def arguments():
-    parser = argparse.ArgumentParser(prog="scripts/bench", description="What the product costs, beside its peers.")
+    parser = argparse.ArgumentParser(
+        prog="scripts/bench", description="What the product costs, beside a floor and its peers.",
+        epilog="Times mean little on a busy machine; the ratios, which are taken round by round, mean more.")
     parser.add_argument("--only", metavar="PATTERN", default="", help="only the rows that match")
     parser.add_argument("--rounds", type=int, metavar="N", help=f"how often all is measured (default {ROUNDS})")
     parser.add_argument("--quick", action="store_true", help=f"{QUICK_ROUNDS} rounds, and less of what takes long")
     parser.add_argument("--build", type=pathlib.Path, metavar="DIR", default=ROOT / "build" / "bench",
-                        help="the product's build folder, if it is another than the measurements'")
-    parser.add_argument("--output", type=pathlib.Path, metavar="FILE", help="write the table, in Markdown")
+                        help="measure the product in this build folder")
+    parser.add_argument("--output", type=pathlib.Path, metavar="FILE", help="write the tables there too, in Markdown")
+    parser.add_argument("--plot", type=pathlib.Path, metavar="FILE.svg",
+                        help="measure and draw how cost grows with jobs, connections and message size")
+    parser.add_argument("--counts", action="store_true", help="instead, count instructions with callgrind")
+    parser.add_argument("--docs", action="store_true",
+                        help="all of it, written into README.md, docs/performance.md and docs/performance.svg")
     return parser.parse_args()
 
 
-def in_sandbox(script, order):
-    run = subprocess.run([ROOT / "scripts" / "sandbox", sys.executable, ROOT / "bench" / script],
+def in_sandbox(script, chosen, **order):
+    order |= {"product": str(chosen.build.resolve()), "tools": str(TOOLS), "quick": chosen.quick,
+              "rounds": chosen.rounds or (QUICK_ROUNDS if chosen.quick else ROUNDS)}
+    run = subprocess.run([ROOT / "scripts" / "sandbox", sys.executable, "-B", ROOT / "bench" / script],
                          input=json.dumps(order), stdout=subprocess.PIPE, text=True)
     if run.returncode != 0:
         sys.exit(f"scripts/bench: {script} ended with status {run.returncode}")
     return json.loads(run.stdout)
 
 
-def number(value, unit):
-    if unit == "us":
-        value /= 1000
-    digits = 3 if value < 1 else 1 if value < 100 else 0
-    return f"{value:,.{digits}f} {unit}"
+def timed(chosen):
+    """The table of times."""
+    pattern = re.compile(chosen.only, re.IGNORECASE)
+    rows = [row for row in ROWS if pattern.search(row.what)]
+    wanted = {name for row in rows for name in (row.ours, row.peer)}
+    if not rows:
+        sys.exit(f"scripts/bench: no row is like {chosen.only}")
+    taken = in_sandbox("measure.py", chosen, names=[name for name in MEASUREMENTS if name in wanted])
+    return report.table(rows, taken)
 
 
-def cells(row, taken):
-    """A line of the table. The ratio is the median of the rounds' ratios."""
-    failure = taken["failures"].get(row.ours) or taken["failures"].get(row.peer)
-    if failure:
-        return (row.what, failure, "", "", "", "no" if row.most or row.least else "")
-    ours, peers = taken["results"][row.ours], taken["results"].get(row.peer, [])
-    figure = statistics.median(ours)
-    ratio = statistics.median(own / peer for own, peer in zip(ours, peers)) if peers else figure
-    limit = f"≤ {row.most:g}" if row.most else f"≥ {row.least:g}" if row.least else ""
-    good = "" if not limit else "yes" if (ratio <= row.most if row.most else ratio >= row.least) else "no"
-    peer = f"{number(statistics.median(peers), row.unit)} ({row.peer_name})" if peers else ""
-    return (row.what, number(figure, row.unit), peer, f"{ratio:.2f} x" if peers else "",
-            limit + ("" if peers or not limit else f" {row.unit}"), good)
+def draw(chosen, path):
+    from plot import draw_curves  # needs what the tables do not
+    draw_curves(in_sandbox("curves.py", chosen), path)
 
 
-def markdown(head, lines):
-    widths = [max(len(line[column]) for line in [head, *lines]) for column in range(len(head))]
-    rows = [head, tuple("-" * width for width in widths), *lines]
-    return "\n".join("| " + " | ".join(cell.ljust(width) for cell, width in zip(row, widths)) + " |"
-                     for row in rows) + "\n"
+def write_docs(chosen):
+    draw(chosen, PLOT)
+    report.put_between(PERFORMANCE, "times", timed(chosen))
+    counts = in_sandbox("counts.py", chosen)
+    for path in (README, PERFORMANCE):
+        report.put_between(path, "counts", report.counts_table(counts))
+    report.put_between(PERFORMANCE, "profile of an enqueue", report.profile_table(counts))
 
 
 def main():
     chosen = arguments()
-    pattern = re.compile(chosen.only, re.IGNORECASE)
-    rows = [row for row in ROWS if pattern.search(row.what)]
-    wanted = {name for row in rows for name in (row.ours, row.peer)}
-    rounds = chosen.rounds or (QUICK_ROUNDS if chosen.quick else ROUNDS)
-    order = {"product": str(chosen.build.resolve()), "tools": str(TOOLS), "rounds": rounds, "quick": chosen.quick,
-             "names": [name for name in MEASUREMENTS if name in wanted]}
-    table = markdown(HEAD, [cells(row, taken) for taken in [in_sandbox("measure.py", order)] for row in rows])
-    print(table, end="")
+    if chosen.docs:
+        write_docs(chosen)
+        return
+    if chosen.counts:
+        counts = in_sandbox("counts.py", chosen)
+        text = report.counts_table(counts) + "\nWhere an enqueue goes:\n\n" + report.profile_table(counts)
+    elif chosen.plot and not chosen.only:
+        text = ""
+    else:
+        text = timed(chosen)
+    print(text, end="")
     if chosen.output:
-        chosen.output.write_text(table)
+        chosen.output.write_text(text)
+    if chosen.plot:
+        draw(chosen, chosen.plot)
 
 
 if __name__ == "__main__":

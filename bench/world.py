@@ -81,21 +81,19 @@ class Server:
 class Daemon(Server):
     """
     marubackupd. Its socket is fixed, so that a daemon which is to live beside
-    others has it renamed.
+    others, and therefore has a name, has it renamed.
     """
 
-    def __init__(self, world, name=None):
+    def __init__(self, world, name="", under=()):
         LOCK.unlink(missing_ok=True)
-        process = world.start(world.program("marubackupd"))
+        process = world.start(*under, world.program("marubackupd"))
         await_socket(process, SOCKET)
         super().__init__(world, SOCKET, process)
-        self.gate = None
-        self.fresh_bytes = self.filled = 0
-        self.last_id = 0
+        self.gate = world.fifo(f"{name}.gate")
+        self.fresh_bytes = self.filled = self.last_id = self.last_name = 0
         if name:
             self.path = world.folder / f"{name}.socket"
             SOCKET.rename(self.path)
-            self.gate = world.fifo(f"{name}.gate")
 
     def hold(self):
         """Occupies the backup queue's one place by a job that waits at the gate."""
@@ -178,7 +176,8 @@ class World:
 
     def fifo(self, name):
         path = self.folder / name
-        os.mkfifo(path)
+        if not path.exists():
+            os.mkfifo(path)
         return path
 
     def program(self, name):
