@@ -22,6 +22,7 @@ def pin(world, cores):
 
 def take(world, name, results, failures):
     measurement = MEASUREMENTS[name]
+    print(".", end="", file=sys.stderr, flush=True)
     try:
         # The first time is not like the others: servers start and fill, caches are cold.
         if measurement.rounds > DEAR_ROUNDS and not results[name]:
@@ -38,17 +39,12 @@ def measure(world, names):
     results = {name: [] for name in names}
     failures = {}
     for number in range(world.rounds):
-        print(f"round {number + 1} of {world.rounds}", file=sys.stderr, flush=True)
+        print(f"\nround {number + 1} of {world.rounds}: ", end="", file=sys.stderr)
         for name in names:
             if name not in failures and number < MEASUREMENTS[name].rounds:
                 take(world, name, results, failures)
+    print(file=sys.stderr)
     return {"results": results, "failures": failures}
-
-
-def curve(world, takes, rounds):
-    """The medians of each of `takes`, which are taken in turn."""
-    values = [[take(world) for take in takes] for _ in range(rounds)]
-    return [sorted(column)[rounds // 2] for column in zip(*values)]
 
 
 def main():

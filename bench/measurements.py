@@ -1,13 +1,12 @@
 """What is measured, and what the table says of it."""
 
 import dataclasses
-import os
 import pathlib
 import subprocess
 import time
 import typing
 
-from world import ACTION_BACKUP, LARGE_BACKEND, World
+from world import LARGE_BACKEND, World
 
 BATCH = 300  # requests in one round
 JOBS = 5000
@@ -37,8 +36,8 @@ def launch(world, *arguments, **options):
     return world.tool("launch_times", "--fifo", world.stamps, "--count", LAUNCHES, *words, *arguments)["ns"]
 
 
-def stamp_under(world, *command):
-    return launch(world, "command", "--", *command, world.tools / "stamp", world.stamps)
+def spawned(world):
+    return launch(world, "spawn", "--", world.tools / "stamp", world.stamps)
 
 
 def under_task_spooler(world):
@@ -110,12 +109,27 @@ def last_of(daemon):
     return daemon.unique(daemon.last_name)
 
 
+def get_of_last(world, **options):
+    daemon = world.waiting(100000)
+    return daemon.time("get", BATCH, id=daemon.last_id, **options)
+
+
 def floor_record(connections):
     return lambda world: world.floor.time("record", BATCH * 4, connections=connections)
 
 
+def get_of_held(world, count=BATCH, **options):
+    daemon = world.waiting(0)
+    return daemon.time("get", count, id=daemon.held_id, **options)
+
+
 def own_get(connections):
-    return lambda world: world.waiting(0).time("get", BATCH * 4, connections=connections)
+    return lambda world: get_of_held(world, BATCH * 4, connections=connections)
+
+
+def unique_of_held(world):
+    daemon = world.waiting(0)
+    return daemon.time("list", BATCH, unique=daemon.unique(daemon.held_name))
 
 
 def list_of_thousand(op):
@@ -138,20 +152,18 @@ MEASUREMENTS = {
     "put 0": requests(lambda world: world.beanstalkd(0).put(BATCH)),
     "put 10000": requests(lambda world: world.beanstalkd(10000).put(BATCH)),
     "put 100000": requests(lambda world: world.beanstalkd(100000).put(BATCH)),
-    "get of one": requests(lambda world: world.waiting(0).time("get", BATCH)),
-    "get last": requests(
-        lambda world: world.waiting(100000).time("get", BATCH, id=world.waiting(100000).last_id)),
-    "unique of one": requests(
-        lambda world: world.waiting(0).time("list", BATCH, unique=world.waiting(0).unique(1))),
+    "get of one": requests(get_of_held),
+    "get last": requests(get_of_last),
+    "unique of one": requests(unique_of_held),
     "unique of last": requests(
         lambda world: world.waiting(100000).time("list", BATCH, unique=last_of(world.waiting(100000)))),
     "list 1000": requests(list_of_thousand("list")),
     "rewrite 1000": requests(list_of_thousand("rewrite")),
-    "get alone": Measurement(lambda world: world.waiting(100000).time("get", BATCH * 4)),
-    "get beside": Measurement(lambda world: world.waiting(100000).time("get", BATCH * 4, beside=LARGE_BACKEND)),
+    "get alone": Measurement(get_of_last),
+    "get beside": Measurement(lambda world: get_of_last(world, beside=LARGE_BACKEND)),
     "gap 0": Measurement(gap_with_none),
     "gap 100000": Measurement(lambda world: world.waiting(100000).gap()),
-    "spawn": Measurement(lambda world: stamp_spawned(world)),
+    "spawn": Measurement(spawned),
     "add": Measurement(add_job),
     "tsp": Measurement(under_task_spooler),
     "nq": Measurement(under_nq),
@@ -164,10 +176,6 @@ MEASUREMENTS = {
     "loop jobs": Measurement(lambda world: rate(world, "loop"), rounds=DEAR_ROUNDS),
     "at rest": Measurement(at_rest, rounds=1),
 }
-
-
-def stamp_spawned(world):
-    return launch(world, "spawn", "--", world.tools / "stamp", world.stamps)
 
 
 @dataclasses.dataclass(frozen=True)

@@ -75,7 +75,9 @@ Op opOf(const Options& options) {
         return framed([&](int number) { return idRequest("job_remove", options.id + number); });
     }
     if (options.op == "list") {
-        return framed([&](int) { return listRequest("unique", options.unique); });
+        Op list = framed([&](int) { return listRequest("unique", options.unique); });
+        list.goodReply += ",\"jobs\":[{"; // found something
+        return list;
     }
     if (options.op == "put") {
         return {Wire::LINES, "INSERTED ", [&](int number) {
@@ -147,11 +149,14 @@ class SlowReader {
 public:
     explicit SlowReader(const Options& options) : connection(options.socket, Wire::FRAMES) {
         connection.send(bench::frame(listRequest("backend", options.slowBackend)));
+        char byte = 0;
+        ::recv(connection.descriptor(), &byte, 1, 0); // the reply is made, and on its way
         thread = std::thread([this] { read(); });
     }
 
     ~SlowReader() {
         stopping = true;
+        shutdown(connection.descriptor(), SHUT_RD);
         thread.join();
     }
 
@@ -159,7 +164,7 @@ private:
     void read() {
         std::vector<char> piece(16384);
         while (!stopping && ::recv(connection.descriptor(), piece.data(), piece.size(), 0) > 0) {
-            std::this_thread::sleep_for(std::chrono::milliseconds(2));
+            std::this_thread::sleep_for(std::chrono::milliseconds(5));
         }
     }
 
@@ -227,7 +232,10 @@ Result fill(const Options& options, const Op& op, int seconds) {
         for (int i = 0; i < group; ++i) {
             const std::string_view reply = connection.receive();
             check(op, reply);
-            (at + i == 0 ? result.first : result.last) = reply;
+            result.last = reply;
+            if (at + i == 0) {
+                result.first = reply;
+            }
         }
     }
     return result;

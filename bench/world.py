@@ -4,6 +4,7 @@ import functools
 import json
 import os
 import pathlib
+import resource
 import shutil
 import socket
 import subprocess
@@ -14,10 +15,10 @@ LOCK = pathlib.Path("/var/run/marubackupd.lock")
 BACKENDS = pathlib.Path("/usr/maru/share/marubackup")
 PATIENCE = 60  # seconds, for a server to come up
 FILL_PATIENCE = 60  # seconds, for jobs to be put in
+TOOL_PATIENCE = 150  # seconds, for one number
 LARGE_BACKEND = "bulk"
 LARGE_COUNT = 33000  # jobs, whose list is a reply of 10 MB
 GAPS = 20  # jobs that follow each other in one round
-ACTION_BACKUP = 1
 
 BACKEND_TEXT = """
 [{action}]
@@ -90,14 +91,15 @@ class Daemon(Server):
         await_socket(process, SOCKET)
         super().__init__(world, SOCKET, process)
         self.gate = world.fifo(f"{name}.gate")
-        self.fresh_bytes = self.filled = self.last_id = self.last_name = 0
+        self.fresh_bytes = self.filled = self.last_id = self.last_name = self.held_id = self.held_name = 0
         if name:
             self.path = world.folder / f"{name}.socket"
             SOCKET.rename(self.path)
 
     def hold(self):
-        """Occupies the backup queue's one place by a job that waits at the gate."""
-        return self.new("enqueue", 1, branch="gate", gate=self.gate)["first"]
+        """Occupies the backup queue's one place, as soon as it is free, by a job that waits at the gate."""
+        self.held_name = self.serial
+        self.held_id = self.new("enqueue", 1, branch="gate", gate=self.gate)["first"]
 
     def queue_gaps(self):
         """Jobs that follow each other once the gate is opened, and one to hold again."""
@@ -109,6 +111,8 @@ class Daemon(Server):
         self.fresh_bytes = private_bytes(self.process.pid)
         large = min(count // 3, LARGE_COUNT)
         for backend, number in ((LARGE_BACKEND, large), ("bench", count - large)):
+            if number == 0:
+                continue
             before = self.serial
             answer = self.new("enqueue", number, backend=backend, fill=FILL_PATIENCE)
             put = answer["last"] - answer["first"] + 1
@@ -167,6 +171,9 @@ class World:
         os.environ["TS_MAXFINISHED"] = "10"
         os.environ["NQDIR"] = str(self.folder / "nq")
         self.write_backends()
+        # What a shell gives its commands; some close all that they could have.
+        _, most = resource.getrlimit(resource.RLIMIT_NOFILE)
+        resource.setrlimit(resource.RLIMIT_NOFILE, (min(1024, most), most))
 
     def write_backends(self):
         text = "".join(BACKEND_TEXT.format(action=action, tools=self.tools, fifo=self.stamps)
@@ -194,7 +201,10 @@ class World:
         command = [str(self.tools / name)] + [str(word) for word in arguments]
         for key, value in options.items():
             command += [f"--{key}", str(value)]
-        run = subprocess.run(command, capture_output=True, text=True)
+        try:
+            run = subprocess.run(command, capture_output=True, text=True, timeout=TOOL_PATIENCE)
+        except subprocess.TimeoutExpired as expired:
+            raise Failed(f"{name} takes longer than {TOOL_PATIENCE} seconds") from expired
         if run.returncode != 0:
             raise Failed(run.stderr.strip() or f"{name}: status {run.returncode}")
         return json.loads(run.stdout)
@@ -206,7 +216,8 @@ class World:
             self.daemons[count] = daemon
             daemon.hold()
             if count >= 100000:
-                for _ in range(self.rounds):
+                # One more, for the round before the first one that counts.
+                for _ in range(self.rounds + 1):
                     daemon.queue_gaps()
             if count > 0:
                 daemon.fill(count)
