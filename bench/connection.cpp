@@ -83,14 +83,13 @@ std::size_t Connection::replySize() const {
         return 0;
     }
     const std::size_t body = text.substr(0, 6) == "FOUND " ? text.rfind(' ', line) : line;
-    return line + LINE_END.size() +
-           (body < line ? std::strtoul(text.data() + body, nullptr, 10) + LINE_END.size() : 0);
+    return line + LINE_END.size() + (body < line ? std::strtoul(text.data() + body, nullptr, 10) + LINE_END.size() : 0);
 }
 
 void Connection::readMore(std::size_t wanted) {
     if (begin > 0) {
-        std::copy(buffer.begin() + static_cast<std::ptrdiff_t>(begin), buffer.begin() + static_cast<std::ptrdiff_t>(end),
-                  buffer.begin());
+        std::copy(buffer.begin() + static_cast<std::ptrdiff_t>(begin),
+                  buffer.begin() + static_cast<std::ptrdiff_t>(end), buffer.begin());
         end -= begin;
         begin = 0;
     }

@@ -14,7 +14,7 @@ CONNECTIONS = (1, 2, 4, 8, 16, 32, 64, 128, 256, 512)
 SIZES = (250, 500, 1000, 2000, 4000, 8000, 16000)
 BATCH = 300
 CONNECTED_BATCH = 2048
-ROUNDS = 5
+ROUNDS = 9
 
 
 def own_put(count, **options):
@@ -43,7 +43,8 @@ def by_connections():
                 for width in CONNECTIONS]
 
     return CONNECTIONS, {
-        "job_get": [lambda world, width=width: get_of_held(world, CONNECTED_BATCH, connections=width) for width in CONNECTIONS],
+        "job_get": [lambda world, width=width: get_of_held(world, CONNECTED_BATCH, connections=width)
+                    for width in CONNECTIONS],
         "floor": each(lambda world: world.floor, "record"),
         "beanstalkd peek": each(lambda world: world.beanstalkd(1), "peek"),
     }
@@ -66,7 +67,7 @@ def medians(world, places, series):
     for place in range(len(places)):
         rounds = []
         for take in series.values():
-            take[place](world)
+            take[place](world)  # servers start and fill
         pin(world, {max(os.sched_getaffinity(0))})
         for _ in range(ROUNDS):
             rounds.append([take[place](world) for take in series.values()])
@@ -78,10 +79,10 @@ def medians(world, places, series):
 
 def main():
     order = json.load(sys.stdin)
-    world = World(order["product"], order["tools"], 1)
+    world = World(order)
     try:
         panels = {
-            "jobs waiting": by_jobs(QUICK_WAITING if order["quick"] else WAITING),
+            "jobs waiting": by_jobs(QUICK_WAITING if world.quick else WAITING),
             "connections": by_connections(),
             "bytes of a job": by_size(),
         }

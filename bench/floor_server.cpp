@@ -58,8 +58,7 @@ void onReadable(bufferevent* connection, void*) {
     std::uint32_t header = 0;
     while (evbuffer_copyout(input, &header, sizeof header) == static_cast<ev_ssize_t>(sizeof header)) {
         const std::size_t length = ntohl(header);
-        const unsigned char* const bytes =
-            evbuffer_pullup(input, static_cast<ev_ssize_t>(sizeof header + length));
+        const unsigned char* const bytes = evbuffer_pullup(input, static_cast<ev_ssize_t>(sizeof header + length));
         if (bytes == nullptr) {
             return;
         }
@@ -76,7 +75,8 @@ void onEnd(bufferevent* connection, short, void*) {
 }
 
 void onConnection(evconnlistener* listener, evutil_socket_t fd, sockaddr*, int, void*) {
-    bufferevent* const connection = bufferevent_socket_new(evconnlistener_get_base(listener), fd, BEV_OPT_CLOSE_ON_FREE);
+    bufferevent* const connection =
+        bufferevent_socket_new(evconnlistener_get_base(listener), fd, BEV_OPT_CLOSE_ON_FREE);
     bufferevent_setcb(connection, onReadable, nullptr, onEnd, nullptr);
     bufferevent_enable(connection, EV_READ | EV_WRITE);
 }

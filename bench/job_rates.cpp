@@ -106,9 +106,7 @@ int main(int argc, char** argv) {
     app.add_option("--folder", options.folders, "nq's folders");
     app.add_subcommand("queue", "through the daemon")->callback([&] { run = [&] { throughQueue(options); }; });
     app.add_subcommand("loop", "as children")->callback([&] { run = [&] { bareLoop(options); }; });
-    app.add_subcommand("tsp", "through task-spooler")->callback([&] {
-        run = [&] { throughTaskSpooler(options); };
-    });
+    app.add_subcommand("tsp", "through task-spooler")->callback([&] { run = [&] { throughTaskSpooler(options); }; });
     app.add_subcommand("nq", "through nq")->callback([&] { run = [&] { throughNq(options); }; });
     CLI11_PARSE(app, argc, argv);
     try {

@@ -8,7 +8,7 @@ import subprocess
 import sys
 
 import report
-from measurements import MEASUREMENTS, ROWS
+from measurements import JOBS, MEASUREMENTS, QUICK_JOBS, ROWS
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent
 TOOLS = ROOT / "build" / "bench" / "bench"
@@ -55,7 +55,8 @@ def timed(chosen):
     if not rows:
         sys.exit(f"scripts/bench: no row is like {chosen.only}")
     taken = in_sandbox("measure.py", chosen, names=[name for name in MEASUREMENTS if name in wanted])
-    return report.table(rows, taken)
+    note = f"\nWith --quick, {QUICK_JOBS:,} jobs stand for {JOBS:,}.\n" if chosen.quick else ""
+    return report.table(rows, taken) + note
 
 
 def draw(chosen, path):

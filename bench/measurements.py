@@ -10,8 +10,10 @@ from world import LARGE_BACKEND, World
 
 BATCH = 300  # requests in one round
 JOBS = 5000
+QUICK_JOBS = 1000
 SLOTS = 5
 AT_REST = 10  # seconds
+QUICK_AT_REST = 4
 LAUNCHES = 15  # in one round
 DEAR_ROUNDS = 3  # of what takes seconds
 
@@ -64,7 +66,7 @@ def add_by_command(world):
 
 def rate(world, way, *options):
     nanoseconds = world.tool("job_rates", "--fifo", world.stamps, "--job", world.tools / "nothing", "--stamp",
-                             world.tools / "stamp", "--count", JOBS, *options, way)["ns"]
+                             world.tools / "stamp", "--count", QUICK_JOBS if world.quick else JOBS, *options, way)["ns"]
     return 1e9 / nanoseconds
 
 
@@ -95,7 +97,7 @@ def at_rest(world):
     """Per cent of a core, over a whole number of the daemon's passes."""
     pid = world.waiting(10000).process.pid
     before, start = processor_nanoseconds(pid), time.monotonic()
-    time.sleep(AT_REST)
+    time.sleep(QUICK_AT_REST if world.quick else AT_REST)
     return (processor_nanoseconds(pid) - before) / (time.monotonic() - start) / 1e7
 
 
@@ -133,7 +135,7 @@ def unique_of_held(world):
 
 
 def list_of_thousand(op):
-    return lambda world: world.waiting(1000).time(op, 20)
+    return lambda world: world.waiting(1000).time(op, 30)
 
 
 # In the order in which a round takes them: what is compared stands side by side.

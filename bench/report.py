@@ -47,19 +47,21 @@ def counts_table(counts):
 
 
 def short_name(function):
+    """A function without its parameters, as code; other names as they are."""
+    if "(" not in function:
+        return function
     name = re.sub(r"\[abi:\w+\]|MARU::Backup::|\(anonymous namespace\)::", "", function)
-    return re.sub(r"\(.*\)( const)?", "()", name)
+    return "`" + re.sub(r"\(.*\)( const)?('\d+)?", "()", name) + "`"
 
 
 def profile_table(counts):
     """Where the instructions of an enqueue go: by step, then by library."""
     profile = counts["enqueue"]
 
-    def lines(parts, code=""):
-        return [(code + short_name(name) + code, f"{cost:,.0f}", f"{cost / profile['total']:.0%}")
-                for name, cost in parts]
+    def lines(parts):
+        return [(short_name(name), f"{cost:,.0f}", f"{cost / profile['total']:.0%}") for name, cost in parts]
 
-    return (markdown(("step", "instructions", "share"), lines(profile["steps"], "`")) + "\n" +
+    return (markdown(("step", "instructions", "share"), lines(profile["steps"])) + "\n" +
             markdown(("by itself", "instructions", "share"), lines(profile["objects"])))
 
 
@@ -68,7 +70,7 @@ def put_between(path, mark, text):
     path = pathlib.Path(path)
     begin, end = f"<!-- {mark} -->\n", f"<!-- end of {mark} -->"
     before, found, rest = path.read_text().partition(begin)
-    old, also_found, after = rest.partition(end)
+    _, also_found, after = rest.partition(end)
     if not found or not also_found:
         raise ValueError(f"{path} has no place for {mark}")
     path.write_text(before + begin + text + end + after)

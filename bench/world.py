@@ -86,7 +86,8 @@ class Daemon(Server):
     """
 
     def __init__(self, world, name="", under=()):
-        LOCK.unlink(missing_ok=True)
+        for path in (LOCK, SOCKET):
+            path.unlink(missing_ok=True)
         process = world.start(*under, world.program("marubackupd"))
         await_socket(process, SOCKET)
         super().__init__(world, SOCKET, process)
@@ -150,8 +151,8 @@ class Beanstalkd(Server):
         self.first_id = self.new("put", max(waiting, 1), fill=FILL_PATIENCE)["first"]
         self.bytes_a_job = (private_bytes(process.pid) - fresh) / max(waiting, 1)
 
-    def put(self, count):
-        answer = self.new("put", count)
+    def put(self, count, **options):
+        answer = self.new("put", count, **options)
         self.ask("delete", id=answer["first"], count=count)
         return answer["ns"]
 
@@ -159,8 +160,9 @@ class Beanstalkd(Server):
 class World:
     """Everything that the measurements use; `waiting` daemons are kept by how many jobs wait in them."""
 
-    def __init__(self, product, tools, rounds):
-        self.product, self.tools, self.rounds = pathlib.Path(product), pathlib.Path(tools), rounds
+    def __init__(self, order):
+        self.product, self.tools = pathlib.Path(order["product"]), pathlib.Path(order["tools"])
+        self.rounds, self.quick = order["rounds"], order["quick"]
         self.folder = pathlib.Path(os.environ["TMPDIR"]) / "bench"
         self.folder.mkdir()
         self.stamps = self.fifo("stamps")
@@ -227,9 +229,16 @@ class World:
         return daemon
 
     @functools.cached_property
+    def _idle(self):
+        return Daemon(self, "idle")
+
+    @property
     def idle(self):
-        """The daemon at the fixed socket, without a job."""
-        return Daemon(self)
+        """The daemon without a job, which is then found at the fixed socket."""
+        daemon = self._idle
+        SOCKET.unlink(missing_ok=True)
+        SOCKET.symlink_to(daemon.path)
+        return daemon
 
     @functools.cached_property
     def floor(self):
