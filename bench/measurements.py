@@ -111,9 +111,9 @@ def last_of(daemon):
     return daemon.unique(daemon.last_name)
 
 
-def get_of_last(world, **options):
+def get_of_last(world, count=BATCH, **options):
     daemon = world.waiting(100000)
-    return daemon.time("get", BATCH, id=daemon.last_id, **options)
+    return daemon.time("get", count, id=daemon.last_id, **options)
 
 
 def floor_record(connections):
@@ -161,8 +161,8 @@ MEASUREMENTS = {
         lambda world: world.waiting(100000).time("list", BATCH, unique=last_of(world.waiting(100000)))),
     "list 1000": requests(list_of_thousand("list")),
     "rewrite 1000": requests(list_of_thousand("rewrite")),
-    "get alone": Measurement(get_of_last),
-    "get beside": Measurement(lambda world: get_of_last(world, beside=LARGE_BACKEND)),
+    "get alone": requests(lambda world: get_of_last(world, BATCH * 4)),
+    "get beside": requests(lambda world: get_of_last(world, BATCH * 4, beside=LARGE_BACKEND)),
     "gap 0": Measurement(gap_with_none),
     "gap 100000": Measurement(lambda world: world.waiting(100000).gap()),
     "spawn": Measurement(spawned),
