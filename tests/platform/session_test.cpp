@@ -39,6 +39,7 @@ using support::inNewRoot;
 using support::isThere;
 using support::Mount;
 using support::newVolume;
+using support::OUTSIDE;
 using support::readFile;
 using support::runInChild;
 using support::sessionRecord;
@@ -50,26 +51,14 @@ using testing::StartsWith;
 
 namespace {
 
-/** A folder beside the sessions, on their file system. */
-const std::string OUTSIDE = "/tmp/outside";
-
 /** Where tests put records away for a while. */
 const std::string ASIDE = "/var/run/aside";
 
 /** Sessions in a /tmp of their own, and a folder outside of all of them in which nothing may ever be missing. */
 class ASession : public testing::Test {
 protected:
-    ASession() {
-        fs::create_directories(OUTSIDE + "/deep/er");
-        writeFile(OUTSIDE + "/kept", "kept");
-        writeFile(OUTSIDE + "/deep/er/kept", "kept");
-    }
-    ~ASession() override {
-        EXPECT_EQ("kept", readFile(OUTSIDE + "/kept"));
-        EXPECT_EQ("kept", readFile(OUTSIDE + "/deep/er/kept"));
-    }
-
-    support::SessionAreas areas;
+    const support::SessionAreas areas;
+    const support::FilesOutside outside;
 };
 
 using SessionRemoval = ASession;
@@ -699,8 +688,7 @@ TEST_F(SessionRemoval, TouchesNothingOutsideWhenAFolderIsSwappedForALinkMeanwhil
 
         swapping.end();
         fs::remove_all("/tmp/link");
-        EXPECT_EQ("kept", readFile(OUTSIDE + "/kept"));
-        EXPECT_EQ("kept", readFile(OUTSIDE + "/deep/er/kept"));
+        outside.expectKept();
         EXPECT_TRUE(session.destroy()) << "nobody is in the way now";
     }
 }

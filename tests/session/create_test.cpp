@@ -35,13 +35,7 @@ std::string complaint(const std::string& id, long lifetime) {
     return "failed to add clean session event[" + id + "][" + std::to_string(lifetime) + "]";
 }
 
-class CreatingATimedSession : public TimedSessionTest {
-protected:
-    CreatingATimedSession() {
-        fs::create_directory(OUTSIDE);
-    }
-};
-
+using CreatingATimedSession = TimedSessionTest;
 using ATimedSession = TimedSessionTest;
 
 } // namespace

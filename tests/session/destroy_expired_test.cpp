@@ -15,6 +15,7 @@ namespace fs = std::filesystem;
 using MARU::Backup::TimedSession;
 using support::inNewRoot;
 using support::isThere;
+using support::OUTSIDE;
 using support::readFile;
 using support::setTimes;
 
@@ -25,20 +26,14 @@ const long SHORTEST = std::numeric_limits<long>::min();
 
 class DestroyExpired : public TimedSessionTest {
 protected:
-    DestroyExpired() {
-        fs::create_directory(OUTSIDE);
-        support::writeFile(OUTSIDE + "/kept", "kept");
-    }
-    ~DestroyExpired() override {
-        EXPECT_EQ("kept", readFile(OUTSIDE + "/kept"));
-    }
-
     /** What destroyExpired() says to a fresh session whose directory was changed at `stamp`. */
     static long leftAfter(time_t stamp, long lifetime, bool walkFiles) {
         const Made session = makeSession();
         setTimes(session.path, 0, stamp);
         return TimedSession::destroyExpired(session.id, lifetime, walkFiles);
     }
+
+    const support::FilesOutside outside;
 };
 
 } // namespace

@@ -13,9 +13,6 @@
 /** A lifetime that ends long after every test. */
 const long LONG_TIME = 100000;
 
-/** A place beside the sessions, on their file system. */
-const std::string OUTSIDE = "/tmp/outside";
-
 /** Sessions in a /tmp of their own, with syslog at hand. */
 class TimedSessionTest : public testing::Test {
 protected:

@@ -25,6 +25,7 @@
 namespace fs = std::filesystem;
 
 using MARU::Backup::TimedSession;
+using support::OUTSIDE;
 using support::setTimes;
 
 namespace {

@@ -27,6 +27,9 @@ inline std::string sessionRecord(const std::string& id) {
     return SESSION_RECORDS + "/" + id;
 }
 
+/** A place beside the sessions, on their file system. */
+const std::string OUTSIDE = "/tmp/outside";
+
 /** Whether something stands there, a link that leads nowhere included. */
 inline bool isThere(const std::string& path) {
     return std::filesystem::exists(std::filesystem::symlink_status(path));
@@ -54,6 +57,31 @@ private:
     }
 
     Mount area;
+};
+
+/** Files at OUTSIDE that nobody may take or change: the test fails if one is not as it was when the object ends. */
+class FilesOutside {
+public:
+    FilesOutside() {
+        std::filesystem::create_directories(OUTSIDE + "/deep/er");
+        for (const std::string& file : files) {
+            writeFile(file, "kept");
+        }
+    }
+    ~FilesOutside() {
+        expectKept();
+    }
+    FilesOutside(const FilesOutside&) = delete;
+    FilesOutside& operator=(const FilesOutside&) = delete;
+
+    void expectKept() const {
+        for (const std::string& file : files) {
+            EXPECT_EQ("kept", isThere(file) ? readFile(file) : "taken") << file;
+        }
+    }
+
+private:
+    const std::string files[2] = {OUTSIDE + "/kept", OUTSIDE + "/deep/er/kept"};
 };
 
 /** Sets when a file was read and changed last; of a link, its own times. */

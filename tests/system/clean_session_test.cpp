@@ -28,14 +28,12 @@ namespace fs = std::filesystem;
 using namespace MARU::Backup;
 using support::expectLocated;
 using support::isThere;
+using support::OUTSIDE;
 using support::setTimes;
 
 namespace {
 
 const long LONG_TIME = 100000;
-
-/** A place beside the sessions, on their file system. */
-const std::string OUTSIDE = "/tmp/outside";
 
 const std::string NO_JOBS = "{\"code\":200,\"jobs\":[]}";
 
@@ -72,16 +70,11 @@ std::pair<time_t, long> lastLook(const std::string& folder) {
 class SessionCleanUp : private support::SessionAreas, public DaemonTest {
 protected:
     SessionCleanUp() {
-        fs::create_directories(OUTSIDE + "/deep");
-        support::writeFile(OUTSIDE + "/kept", "kept");
-        support::writeFile(OUTSIDE + "/deep/kept", "kept");
         start();
         peer = std::make_unique<support::SocketPeer>();
     }
     ~SessionCleanUp() override {
         EXPECT_EQ(NO_JOBS, peer->ask("{\"op\":\"job_list\"}")) << "the daemon serves";
-        EXPECT_EQ("kept", support::readFile(OUTSIDE + "/kept"));
-        EXPECT_EQ("kept", support::readFile(OUTSIDE + "/deep/kept"));
     }
 
     /** A session that the daemon will not come to. */
@@ -104,6 +97,7 @@ protected:
                       "failed to destroy expired session[" + id + "][" + std::to_string(lifetime) + "]");
     }
 
+    const support::FilesOutside outside;
     std::unique_ptr<support::SocketPeer> peer;
 };
 
