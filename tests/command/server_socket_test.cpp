@@ -26,6 +26,7 @@ namespace fs = std::filesystem;
 
 using MARU::Backup::CommandServer;
 using support::expectLocated;
+using support::isThere;
 using support::refuseSystemCalls;
 using support::SocketPeer;
 
@@ -39,10 +40,6 @@ struct stat statOf(const std::string& path) {
     struct stat record = {};
     EXPECT_EQ(0, lstat(path.c_str(), &record)) << path;
     return record;
-}
-
-bool isThere(const std::string& path) {
-    return fs::exists(fs::symlink_status(path));
 }
 
 mode_t currentUmask() {

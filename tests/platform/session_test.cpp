@@ -38,8 +38,10 @@ using support::describeStatus;
 using support::inNewRoot;
 using support::isThere;
 using support::Mount;
+using support::namesIn;
 using support::newVolume;
 using support::OUTSIDE;
+using support::permissionsOf;
 using support::readFile;
 using support::runInChild;
 using support::sessionRecord;
@@ -63,20 +65,6 @@ protected:
 
 using SessionRemoval = ASession;
 using SessionVolumes = ASession;
-
-mode_t modeOf(const std::string& path) {
-    struct stat info = {};
-    EXPECT_EQ(0, lstat(path.c_str(), &info)) << path;
-    return info.st_mode & 07777;
-}
-
-std::vector<std::string> namesIn(const std::string& folder) {
-    std::vector<std::string> names;
-    for (const fs::directory_entry& entry : fs::directory_iterator(folder)) {
-        names.push_back(entry.path().filename());
-    }
-    return names;
-}
 
 void expectGone(const std::string& id, const std::string& path) {
     EXPECT_FALSE(isThere(path)) << path;
@@ -167,7 +155,7 @@ TEST_F(ASession, IsAnEmptyDirectoryOfItsOwnersAloneWhateverTheUmask) {
         umask(before);
 
         EXPECT_EQ("/tmp/marusession-" + session.getId(), session.getPath());
-        EXPECT_EQ(0700U, modeOf(session.getPath()));
+        EXPECT_EQ(0700U, permissionsOf(session.getPath()));
         EXPECT_THAT(namesIn(session.getPath()), IsEmpty());
     }
 }
@@ -188,8 +176,8 @@ TEST_F(ASession, HasARecordThatHoldsItsPath) {
     session.create();
 
     EXPECT_EQ(session.getPath() + "\n", readFile(sessionRecord(session.getId())));
-    EXPECT_EQ(0600U, modeOf(sessionRecord(session.getId())));
-    EXPECT_EQ(0700U, modeOf(support::SESSION_RECORDS));
+    EXPECT_EQ(0600U, permissionsOf(sessionRecord(session.getId())));
+    EXPECT_EQ(0700U, permissionsOf(support::SESSION_RECORDS));
     EXPECT_THAT(namesIn(support::SESSION_RECORDS), ElementsAre(session.getId()));
 }
 
@@ -745,7 +733,7 @@ TEST_F(SessionVolumes, AreWritableMountsNamedByANumber) {
         EXPECT_EQ("/volume10", filter->shown[1].path);
         EXPECT_EQ(1U << 20, filter->shown[1].freeBytes);
         EXPECT_EQ("/volume10/marusession-" + session.getId(), session.getPath());
-        EXPECT_EQ(0700U, modeOf(session.getPath()));
+        EXPECT_EQ(0700U, permissionsOf(session.getPath()));
         expectKept(session);
         EXPECT_TRUE(session.destroy());
     });

@@ -29,6 +29,7 @@
 
 using MARU::Backup::SubProcess;
 using support::describeStatus;
+using support::permissionsOf;
 using support::readFile;
 using support::runInChild;
 using support::TempDir;
@@ -124,12 +125,6 @@ std::list<std::string> shell(const std::string& script) {
 
 bool exists(const std::string& path) {
     return access(path.c_str(), F_OK) == 0;
-}
-
-mode_t permissionsOf(const std::string& path) {
-    struct stat info = {};
-    EXPECT_EQ(0, stat(path.c_str(), &info)) << path;
-    return info.st_mode & 07777;
 }
 
 /** The rest of the line of `text` that starts with `label`. */

@@ -17,6 +17,7 @@
 #include <taskmanager/task_mgr.h>
 
 #include "support/appliance.h"
+#include "support/files.h"
 #include "support/in_child.h"
 #include "support/nobody.h"
 
@@ -71,9 +72,7 @@ TEST_F(ATaskFile, CanBeReadByAllAndWrittenByItsOwnerAlone) {
     TaskFile::create(OWNER, "task", 1);
     umask(before);
 
-    struct stat info = {};
-    ASSERT_EQ(0, stat(taskFile(OWNER, "task").c_str(), &info));
-    EXPECT_EQ(mode_t(0644), info.st_mode & 07777);
+    EXPECT_EQ(0644U, support::permissionsOf(taskFile(OWNER, "task")));
 }
 
 TEST_F(ATaskFile, IsReplacedByANewTaskOfThatId) {

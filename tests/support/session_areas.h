@@ -30,11 +30,6 @@ inline std::string sessionRecord(const std::string& id) {
 /** A place beside the sessions, on their file system. */
 const std::string OUTSIDE = "/tmp/outside";
 
-/** Whether something stands there, a link that leads nowhere included. */
-inline bool isThere(const std::string& path) {
-    return std::filesystem::exists(std::filesystem::symlink_status(path));
-}
-
 /**
  * No session anywhere, and in place of the host's /tmp an empty one, while the
  * object lives.

@@ -1,7 +1,6 @@
 // What the operator's tool tells of the system, and what it does with sessions.
 
 #include <sys/mount.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <csignal>
@@ -147,9 +146,7 @@ TEST_F(MarubackupctlSession, IsMadeAndFoundAndRemoved) {
     start();
     const std::string id = create("3600");
     const std::string path = pathOf(id);
-    struct stat record = {};
-    ASSERT_EQ(0, stat(path.c_str(), &record));
-    EXPECT_EQ(0700U, record.st_mode & 07777);
+    EXPECT_EQ(0700U, support::permissionsOf(path));
 
     EXPECT_EQ("exit 0", run({"session", "destroy", id}).ended);
     EXPECT_NE(0, access(path.c_str(), F_OK));
