@@ -1,18 +1,15 @@
 #include <marubackup-util/session.h>
 
 #include <fcntl.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <atomic>
-#include <cerrno>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
 #include <set>
 #include <string>
-#include <system_error>
 #include <thread>
 #include <vector>
 
@@ -25,6 +22,7 @@
 #include "support/in_child.h"
 #include "support/mount.h"
 #include "support/nobody.h"
+#include "support/resource_limit.h"
 #include "support/session_areas.h"
 #include "support/waiting.h"
 
@@ -75,16 +73,6 @@ void expectGone(const std::string& id, const std::string& path) {
 void expectKept(const Session& session) {
     EXPECT_TRUE(isThere(session.getPath()));
     EXPECT_EQ(session.getPath(), Session::getPathById(session.getId()));
-}
-
-/** From here on the process gets no more of something. */
-void limitTo(__rlimit_resource resource, rlim_t most) {
-    rlimit limit = {};
-    getrlimit(resource, &limit);
-    limit.rlim_cur = most;
-    if (setrlimit(resource, &limit) != 0) {
-        throw std::system_error(errno, std::generic_category(), "setrlimit");
-    }
 }
 
 /** Makes a chain of folders that is too long to be named by one path, with a file in each. */
@@ -505,8 +493,8 @@ TEST_F(SessionRemoval, TakesATreeOfAnyDepthWithAFewDescriptors) {
     makeDeepTree(session.getPath(), 5000);
 
     const int status = runInChild([&]() {
-        limitTo(RLIMIT_NOFILE, static_cast<rlim_t>(support::openDescriptors(getpid())) + 8);
-        limitTo(RLIMIT_STACK, 256 * 1024);
+        support::limitTo(RLIMIT_NOFILE, static_cast<rlim_t>(support::openDescriptors(getpid())) + 8);
+        support::limitTo(RLIMIT_STACK, 256 * 1024);
         return Session::destroyById(session.getId()) ? 0 : 1;
     });
 

@@ -3,24 +3,22 @@
 #include <marubackup/timed_session.h>
 
 #include <fcntl.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <cstdint>
 #include <cstdlib>
 #include <filesystem>
 #include <limits>
 #include <string>
-#include <system_error>
 #include <vector>
 
 #include "session_fixture.h"
 #include "support/files.h"
 #include "support/in_child.h"
 #include "support/mount.h"
+#include "support/resource_limit.h"
 
 namespace fs = std::filesystem;
 
@@ -73,12 +71,7 @@ protected:
 
 /** Leaves the process exactly this many descriptors to open. */
 void leaveDescriptors(std::size_t number) {
-    rlimit limit = {};
-    getrlimit(RLIMIT_NOFILE, &limit);
-    limit.rlim_cur = 200;
-    if (setrlimit(RLIMIT_NOFILE, &limit) != 0) {
-        throw std::system_error(errno, std::generic_category(), "setrlimit");
-    }
+    support::limitTo(RLIMIT_NOFILE, 200);
     std::vector<int> opened;
     for (int fd = 0; (fd = open("/dev/null", O_RDONLY | O_CLOEXEC)) >= 0;) {
         opened.push_back(fd);

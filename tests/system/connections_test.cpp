@@ -4,7 +4,6 @@
 #include <poll.h>
 #include <sched.h>
 #include <sys/mount.h>
-#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/wait.h>
 #include <syslog.h>
@@ -27,6 +26,7 @@
 #include "support/descriptor_limit.h"
 #include "support/files.h"
 #include "support/named_rows.h"
+#include "support/resource_limit.h"
 #include "support/socket_peer.h"
 #include "support/waiting.h"
 
@@ -229,12 +229,7 @@ protected:
             GTEST_SKIP() << "this user may open too few files";
         }
         support::DaemonOptions options;
-        options.beforeStart = []() {
-            rlimit usual = {};
-            getrlimit(RLIMIT_NOFILE, &usual);
-            usual.rlim_cur = 1024;
-            setrlimit(RLIMIT_NOFILE, &usual);
-        };
+        options.beforeStart = []() { support::limitTo(RLIMIT_NOFILE, 1024); };
         serve(options);
     }
 

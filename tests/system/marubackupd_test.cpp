@@ -18,6 +18,7 @@
 #include "support/backend_files.h"
 #include "support/files.h"
 #include "support/in_child.h"
+#include "support/resource_limit.h"
 #include "support/socket_peer.h"
 #include "support/waiting.h"
 
@@ -137,12 +138,7 @@ TEST_F(Marubackupd, WritesEachLineOfItsDiaryAtOnce) {
 
 TEST_F(Marubackupd, RaisesItsDescriptorLimitAboveTheServersOwn) {
     support::DaemonOptions options;
-    options.beforeStart = []() {
-        rlimit limit = {};
-        getrlimit(RLIMIT_NOFILE, &limit);
-        limit.rlim_cur = 64;
-        setrlimit(RLIMIT_NOFILE, &limit);
-    };
+    options.beforeStart = []() { support::limitTo(RLIMIT_NOFILE, 64); };
     start(options);
     rlimit limit = {};
     ASSERT_EQ(0, prlimit(daemon->pid(), RLIMIT_NOFILE, nullptr, &limit));
