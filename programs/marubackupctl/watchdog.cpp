@@ -38,7 +38,10 @@ public:
         const std::lock_guard<std::mutex> lock(mutex);
         late = onLate;
         gone = onGone;
-        deadline = Clock::now() + std::chrono::duration_cast<Clock::duration>(std::chrono::duration<double>(seconds));
+        const Clock::time_point now = Clock::now();
+        deadline = now + std::chrono::duration_cast<Clock::duration>(std::chrono::duration<double>(seconds));
+        // One that is not there to begin with is the call's own answer.
+        nextLook = now + LOOK_EVERY;
         guarding = true;
         pthread_kill(thread.native_handle(), WAKE_UP);
     }
@@ -67,14 +70,17 @@ private:
         if (!guarding) {
             return LOOK_EVERY;
         }
-        if (gone && !isDaemonThere()) {
-            endWith(*gone);
-        }
         const Clock::time_point now = Clock::now();
+        if (now >= nextLook) {
+            nextLook = now + LOOK_EVERY;
+            if (gone && !isDaemonThere()) {
+                endWith(*gone);
+            }
+        }
         if (now >= deadline) {
             endWith(late);
         }
-        return std::min(LOOK_EVERY, deadline - now);
+        return std::min(nextLook, deadline) - now;
     }
 
     const LastWords interrupted;
@@ -84,6 +90,7 @@ private:
     LastWords late;
     std::optional<LastWords> gone;
     Clock::time_point deadline;
+    Clock::time_point nextLook;
     std::thread thread;
 };
 

@@ -26,6 +26,13 @@ using namespace MARU::Backup;
 
 using Marubackupctl = ToolTest;
 
+namespace {
+
+const std::string NOBODY_ANSWERS = "nobody answers at /var/run/marubackupd.socket: start marubackupd, or, if it runs, "
+                                   "ask as root or as a member of the socket's group";
+
+} // namespace
+
 TEST_F(Marubackupctl, AddPrintsTheIdAloneAndHandsTheParametersOver) {
     start();
     support::Gate& gate = newGate();
@@ -178,10 +185,34 @@ TEST_F(Marubackupctl, WrongUsageIsStatusTwo) {
     }
 }
 
-TEST_F(Marubackupctl, NoDaemonIsStatusFive) {
-    const Outcome outcome = run({"list"});
-    EXPECT_EQ("exit 5", outcome.ended);
-    EXPECT_NE(std::string::npos, outcome.err.find("start marubackupd")) << outcome.err;
+TEST_F(Marubackupctl, TheNameOfAVerbMayBeTheValueOfAnOption) {
+    start();
+    const Outcome outcome = run({"--json", "list", "--backend", "add"});
+    EXPECT_EQ("exit 0", outcome.ended) << outcome.err;
+    EXPECT_EQ("[]\n", outcome.out);
+}
+
+TEST_F(Marubackupctl, HelpNamesAllVerbsWhateverTheLineDoes) {
+    for (const Arguments& line : {Arguments{"--help"}, Arguments{"-h", "--timeout", "3"}}) {
+        const Outcome help = run(line);
+        EXPECT_EQ("exit 0", help.ended);
+        for (const char* verb :
+             {"add", "list", "show", "remove", "wait", "backends", "status", "session", "archive-version"}) {
+            EXPECT_NE(std::string::npos, help.out.find(std::string("\n  ") + verb + " ")) << verb << help.out;
+        }
+    }
+    const Outcome help = run({"session", "--help"});
+    EXPECT_EQ("exit 0", help.ended);
+    EXPECT_NE(std::string::npos, help.out.find("\n  create ")) << help.out;
+    EXPECT_EQ(std::string::npos, help.out.find("\n  archive-version ")) << help.out;
+}
+
+TEST_F(Marubackupctl, NoDaemonIsStatusFiveInTheSameWordsEveryTime) {
+    for (int time = 0; time < 20; ++time) {
+        const Outcome outcome = run({"list"});
+        EXPECT_EQ("exit 5", outcome.ended);
+        EXPECT_EQ("marubackupctl: cannot list: " + NOBODY_ANSWERS + " (code 503)\n", outcome.err);
+    }
 }
 
 TEST_F(Marubackupctl, AStoppedDaemonIsStatus124) {
@@ -228,9 +259,7 @@ TEST_F(Marubackupctl, ADaemonThatGoesAwayInTheMiddleOfItsAnswerIsStatusFive) {
         const Outcome outcome = finish(tool);
         EXPECT_EQ("exit 5", outcome.ended) << sent;
         EXPECT_EQ("", outcome.out);
-        EXPECT_EQ("marubackupctl: the daemon ended meanwhile: nobody answers at /var/run/marubackupd.socket: start "
-                  "marubackupd, or, if it runs, ask as root or as a member of the socket's group\n",
-                  outcome.err);
+        EXPECT_EQ("marubackupctl: the daemon ended meanwhile: " + NOBODY_ANSWERS + "\n", outcome.err);
     }
 }
 
