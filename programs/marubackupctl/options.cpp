@@ -1,9 +1,12 @@
 #include "options.h"
 
 #include <algorithm>
+#include <array>
 #include <charconv>
+#include <functional>
 #include <memory>
 #include <sstream>
+#include <string_view>
 
 #include <CLI/CLI.hpp>
 
@@ -91,13 +94,24 @@ void addJobIds(CLI::App& verb, std::vector<std::string>& texts) {
     verb.add_option("ID", texts, "job ids")->option_text("...")->required()->check(checkJobId);
 }
 
-CLI::App* addVerb(CLI::App& app, const std::string& name, const std::string& description,
-                  const std::string& details = "") {
-    CLI::App* verb = app.add_subcommand(name, description);
+/** A verb of the tool, or of "session" and the like. */
+struct VerbDefinition {
+    const char* name;
+    const char* description;
+    void (*define)(CLI::App& verb, Options& options);
+};
+
+void addVerb(CLI::App& app, const VerbDefinition& definition, Options& options) {
+    CLI::App* verb = app.add_subcommand(definition.name, definition.description);
     verb->group("Verbs");
-    verb->footer(details + (details.empty() ? "" : "\n") + MORE);
+    verb->footer(MORE);
     verb->get_help_ptr()->description("print this help and exit");
-    return verb;
+    definition.define(*verb, options);
+}
+
+/** What the help of the verb has to say at its end. */
+void explain(CLI::App& verb, const std::string& details) {
+    verb.footer(details + "\n" + MORE);
 }
 
 void defineGlobals(CLI::App& app, Globals& globals) {
@@ -114,26 +128,25 @@ void defineGlobals(CLI::App& app, Globals& globals) {
         ->check(checkTimeout);
 }
 
-void defineAdd(CLI::App& app, Options& options) {
-    CLI::App* verb = addVerb(app, "add", "put a job into the queue, and print its id",
-                             "ACTION is one of " + joined(actionNames(), ", ") + ".");
+void defineAdd(CLI::App& verb, Options& options) {
+    explain(verb, "ACTION is one of " + joined(actionNames(), ", ") + ".");
     const auto add = std::make_shared<AddVerb>();
-    verb->add_option("BACKEND", add->backend, "the backend that does the work (\"marubackupctl backends\")")
+    verb.add_option("BACKEND", add->backend, "the backend that does the work (\"marubackupctl backends\")")
         ->option_text(" ")
         ->required()
         ->check(checkNotEmpty);
-    verb->add_option("ACTION", add->action, "what it does")
+    verb.add_option("ACTION", add->action, "what it does")
         ->option_text(" ")
         ->required()
         ->check(CLI::IsMember(actionNames()));
-    verb->add_option("--branch", add->branch, "run the backend's command_BRANCH, not its command_launch")
+    verb.add_option("--branch", add->branch, "run the backend's command_BRANCH, not its command_launch")
         ->option_text("BRANCH");
     const auto parameters = std::make_shared<std::vector<std::string>>();
-    verb->add_option("-p,--param", *parameters, "a parameter of the job, a text or any JSON value; may be repeated")
+    verb.add_option("-p,--param", *parameters, "a parameter of the job, a text or any JSON value; may be repeated")
         ->option_text("NAME=TEXT | NAME:=JSON")
         ->allow_extra_args(false)
         ->check(checkParameter);
-    verb->callback([&options, add, parameters] {
+    verb.callback([&options, add, parameters] {
         for (const std::string& parameter : *parameters) {
             readParameter(parameter, add->parameters);
         }
@@ -141,76 +154,68 @@ void defineAdd(CLI::App& app, Options& options) {
     });
 }
 
-void defineList(CLI::App& app, Options& options) {
-    CLI::App* verb = addVerb(app, "list", "list the jobs that wait or run");
+void defineList(CLI::App& verb, Options& options) {
     const auto list = std::make_shared<ListVerb>();
-    verb->add_option("--action", list->action, "only those of this action")
+    verb.add_option("--action", list->action, "only those of this action")
         ->option_text("ACTION")
         ->check(CLI::IsMember(actionNames()));
-    verb->add_option("--backend", list->backend, "only those of this backend")
+    verb.add_option("--backend", list->backend, "only those of this backend")
         ->option_text("BACKEND")
         ->check(checkNotEmpty);
-    verb->add_option("--unique", list->unique, "only the one with this unique string")
+    verb.add_option("--unique", list->unique, "only the one with this unique string")
         ->option_text("TEXT")
         ->check(checkNotEmpty);
-    CLI::Option* format = verb->add_option("--format", list->format,
-                                           "only those for which this template, such as "
-                                           "{{BACKEND}} or a parameter's {{name}}, …")
+    CLI::Option* format = verb.add_option("--format", list->format,
+                                          "only those for which this template, such as "
+                                          "{{BACKEND}} or a parameter's {{name}}, …")
                               ->option_text("TEMPLATE")
                               ->check(checkNotEmpty);
     CLI::Option* target =
-        verb->add_option("--target", list->target, "… expands to this text")->option_text("TEXT")->check(checkNotEmpty);
+        verb.add_option("--target", list->target, "… expands to this text")->option_text("TEXT")->check(checkNotEmpty);
     format->needs(target);
     target->needs(format);
-    verb->callback([&options, list] { options.verb = *list; });
+    verb.callback([&options, list] { options.verb = *list; });
 }
 
-void defineShow(CLI::App& app, Options& options) {
-    CLI::App* verb = addVerb(app, "show", "show one job with its parameters");
+void defineShow(CLI::App& verb, Options& options) {
     const auto text = std::make_shared<std::string>();
-    verb->add_option("ID", *text, "the job's id")->option_text(" ")->required()->check(checkJobId);
-    verb->callback([&options, text] { options.verb = ShowVerb{toJobId(*text)}; });
+    verb.add_option("ID", *text, "the job's id")->option_text(" ")->required()->check(checkJobId);
+    verb.callback([&options, text] { options.verb = ShowVerb{toJobId(*text)}; });
 }
 
-void defineRemove(CLI::App& app, Options& options) {
-    CLI::App* verb = addVerb(app, "remove", "remove jobs, running ones too",
-                             "A waiting job is gone at once. A running one is sent SIGTERM, and is listed as stopping\n"
-                             "until its process has ended. Of several failures the worst gives the exit status.");
+void defineRemove(CLI::App& verb, Options& options) {
+    explain(verb, "A waiting job is gone at once. A running one is sent SIGTERM, and is listed as stopping\n"
+                  "until its process has ended. Of several failures the worst gives the exit status.");
     const auto texts = std::make_shared<std::vector<std::string>>();
-    addJobIds(*verb, *texts);
-    verb->callback([&options, texts] { options.verb = RemoveVerb{toJobIds(*texts)}; });
+    addJobIds(verb, *texts);
+    verb.callback([&options, texts] { options.verb = RemoveVerb{toJobIds(*texts)}; });
 }
 
-void defineWait(CLI::App& app, Options& options) {
-    CLI::App* verb = addVerb(app, "wait", "wait until jobs have ended",
-                             "A job that the daemon does not know counts as ended: a short one may be gone before the\n"
-                             "wait begins. Whether it did its work is in the files that its backend writes.");
+void defineWait(CLI::App& verb, Options& options) {
+    explain(verb, "A job that the daemon does not know counts as ended: a short one may be gone before the\n"
+                  "wait begins. Whether it did its work is in the files that its backend writes.");
     const auto longest = std::make_shared<std::optional<double>>();
-    verb->add_option("--for", *longest, "the longest that the whole wait may take, then exit status 124")
+    verb.add_option("--for", *longest, "the longest that the whole wait may take, then exit status 124")
         ->option_text("SECONDS")
         ->check(checkSeconds);
     const auto texts = std::make_shared<std::vector<std::string>>();
-    addJobIds(*verb, *texts);
-    verb->callback([&options, texts, longest] { options.verb = WaitVerb{toJobIds(*texts), *longest}; });
+    addJobIds(verb, *texts);
+    verb.callback([&options, texts, longest] { options.verb = WaitVerb{toJobIds(*texts), *longest}; });
 }
 
-void defineBackends(CLI::App& app, Options& options) {
-    CLI::App* verb =
-        addVerb(app, "backends", "list the installed backends and what they can do",
-                "These are the files in /usr/maru/share/marubackup, each hidden by one of the same name in\n"
-                "/usr/local/share/marubackup. DELEGATE names the actions for which one is a delegate.");
-    verb->callback([&options] { options.verb = BackendsVerb(); });
+void defineBackends(CLI::App& verb, Options& options) {
+    explain(verb, "These are the files in /usr/maru/share/marubackup, each hidden by one of the same name in\n"
+                  "/usr/local/share/marubackup. DELEGATE names the actions for which one is a delegate.");
+    verb.callback([&options] { options.verb = BackendsVerb(); });
 }
 
-void defineStatus(CLI::App& app, Options& options) {
-    CLI::App* verb =
-        addVerb(app, "status", "tell what may start now, and what is at work",
-                "A daemon that cannot be reached counts as one without jobs, as it does for applications.");
+void defineStatus(CLI::App& verb, Options& options) {
+    explain(verb, "A daemon that cannot be reached counts as one without jobs, as it does for applications.");
     const auto status = std::make_shared<StatusVerb>();
-    verb->add_option("--backend", status->backend, "whether this one is at work, not any")
+    verb.add_option("--backend", status->backend, "whether this one is at work, not any")
         ->option_text("BACKEND")
         ->check(checkNotEmpty);
-    verb->callback([&options, status] { options.verb = *status; });
+    verb.callback([&options, status] { options.verb = *status; });
 }
 
 /** The lifetime is read as a text, since CLI11 takes 010 for 8. */
@@ -222,115 +227,156 @@ void addSessionId(CLI::App& verb, std::string& id) {
     verb.add_option("ID", id, "the session's id")->option_text(" ")->required()->check(checkNotEmpty);
 }
 
-void defineSessionCreate(CLI::App& session, Options& options) {
-    CLI::App* verb = addVerb(session, "create", "make a session, and print its id",
-                             "The daemon removes it when it has not been used for its lifetime.");
+void defineSessionCreate(CLI::App& verb, Options& options) {
+    explain(verb, "The daemon removes it when it has not been used for its lifetime.");
     const auto create = std::make_shared<SessionCreateVerb>();
     const auto lifetime = std::make_shared<std::string>();
-    addLifetime(*verb, *lifetime, "how long it lasts unused; 259200, three days, at most")->required();
-    verb->add_flag("--max-volume", create->onMaxVolume, "on the volume with the most free space");
-    verb->callback([&options, create, lifetime] {
+    addLifetime(verb, *lifetime, "how long it lasts unused; 259200, three days, at most")->required();
+    verb.add_flag("--max-volume", create->onMaxVolume, "on the volume with the most free space");
+    verb.callback([&options, create, lifetime] {
         create->lifetime = std::stol(*lifetime);
         options.verb = *create;
     });
 }
 
-void defineSessionPath(CLI::App& session, Options& options) {
-    CLI::App* verb = addVerb(session, "path", "print the directory of a session");
+void defineSessionPath(CLI::App& verb, Options& options) {
     const auto path = std::make_shared<SessionPathVerb>();
-    addSessionId(*verb, path->id);
-    verb->callback([&options, path] { options.verb = *path; });
+    addSessionId(verb, path->id);
+    verb.callback([&options, path] { options.verb = *path; });
 }
 
-void defineSessionDestroy(CLI::App& session, Options& options) {
-    CLI::App* verb = addVerb(session, "destroy", "remove a session with all that is in it");
+void defineSessionDestroy(CLI::App& verb, Options& options) {
     const auto destroy = std::make_shared<SessionDestroyVerb>();
-    addSessionId(*verb, destroy->id);
-    verb->callback([&options, destroy] { options.verb = *destroy; });
+    addSessionId(verb, destroy->id);
+    verb.callback([&options, destroy] { options.verb = *destroy; });
 }
 
-void defineSessionExpire(CLI::App& session, Options& options) {
-    CLI::App* verb = addVerb(session, "expire", "remove a session that has expired, or print how long it has left",
-                             "It has expired when its directory was not changed, and no file in it read, for its\n"
-                             "lifetime. Prints the seconds that are left; 0 if it is gone.");
+void defineSessionExpire(CLI::App& verb, Options& options) {
+    explain(verb, "It has expired when its directory was not changed, and no file in it read, for its\n"
+                  "lifetime. Prints the seconds that are left; 0 if it is gone.");
     const auto expire = std::make_shared<SessionExpireVerb>();
     const auto lifetime = std::make_shared<std::string>();
     const auto ignoreFiles = std::make_shared<bool>(false);
-    addSessionId(*verb, expire->id);
-    addLifetime(*verb, *lifetime, "how long it lasts unused")->required();
-    verb->add_flag("--ignore-files", *ignoreFiles, "that a file was read does not count");
-    verb->callback([&options, expire, lifetime, ignoreFiles] {
+    addSessionId(verb, expire->id);
+    addLifetime(verb, *lifetime, "how long it lasts unused")->required();
+    verb.add_flag("--ignore-files", *ignoreFiles, "that a file was read does not count");
+    verb.callback([&options, expire, lifetime, ignoreFiles] {
         expire->lifetime = std::stol(*lifetime);
         expire->walkFiles = !*ignoreFiles;
         options.verb = *expire;
     });
 }
 
-void defineSession(CLI::App& app, Options& options) {
-    CLI::App* verb = addVerb(app, "session", "make, find and remove session directories");
-    verb->require_subcommand(1);
-    defineSessionCreate(*verb, options);
-    defineSessionPath(*verb, options);
-    defineSessionDestroy(*verb, options);
-    defineSessionExpire(*verb, options);
+const std::array<VerbDefinition, 4> SESSION_VERBS = {{
+    {"create", "make a session, and print its id", defineSessionCreate},
+    {"path", "print the directory of a session", defineSessionPath},
+    {"destroy", "remove a session with all that is in it", defineSessionDestroy},
+    {"expire", "remove a session that has expired, or print how long it has left", defineSessionExpire},
+}};
+
+void defineSession(CLI::App& verb, Options& options) {
+    verb.require_subcommand(1);
+    for (const VerbDefinition& definition : SESSION_VERBS) {
+        addVerb(verb, definition, options);
+    }
 }
 
 template <typename Verb>
-void defineArchiveVersionVerb(CLI::App& archiveVersion, Options& options, const std::string& name,
-                              const std::string& description, const std::string& details = "") {
-    CLI::App* verb = addVerb(archiveVersion, name, description, details);
+void definePathVerb(CLI::App& verb, Options& options) {
     const auto chosen = std::make_shared<Verb>();
-    verb->add_option("PATH", chosen->path, "a file or folder")->option_text(" ")->required()->check(checkNotEmpty);
-    verb->callback([&options, chosen] { options.verb = *chosen; });
+    verb.add_option("PATH", chosen->path, "a file or folder")->option_text(" ")->required()->check(checkNotEmpty);
+    verb.callback([&options, chosen] { options.verb = *chosen; });
 }
 
-void defineArchiveVersion(CLI::App& app, Options& options) {
-    CLI::App* verb = addVerb(app, "archive-version", "read or increase archive versions of files and file systems",
-                             "Where a version differs from the one that was noted down with the last archive, there\n"
-                             "is something to archive again.");
-    verb->require_subcommand(1);
-    defineArchiveVersionVerb<ArchiveVersionGetVerb>(*verb, options, "get",
-                                                    "print the archive version of a file or folder",
-                                                    "One that has none is at 0. A link is looked at itself.");
-    defineArchiveVersionVerb<ArchiveVersionFsGetVerb>(*verb, options, "fs-get",
-                                                      "print the archive version of the file system that PATH is on");
-    defineArchiveVersionVerb<ArchiveVersionFsIncreaseVerb>(
-        *verb, options, "fs-increase", "increase the archive version of the file system, and print the new one",
-        "If it is increased and then cannot be read, that is a failure too: look with fs-get.");
+void defineArchiveVersionGet(CLI::App& verb, Options& options) {
+    explain(verb, "One that has none is at 0. A link is looked at itself.");
+    definePathVerb<ArchiveVersionGetVerb>(verb, options);
 }
+
+void defineArchiveVersionFsIncrease(CLI::App& verb, Options& options) {
+    explain(verb, "If it is increased and then cannot be read, that is a failure too: look with fs-get.");
+    definePathVerb<ArchiveVersionFsIncreaseVerb>(verb, options);
+}
+
+const std::array<VerbDefinition, 3> ARCHIVE_VERSION_VERBS = {{
+    {"get", "print the archive version of a file or folder", defineArchiveVersionGet},
+    {"fs-get", "print the archive version of the file system that PATH is on", definePathVerb<ArchiveVersionFsGetVerb>},
+    {"fs-increase", "increase the archive version of the file system, and print the new one",
+     defineArchiveVersionFsIncrease},
+}};
+
+void defineArchiveVersion(CLI::App& verb, Options& options) {
+    explain(verb, "Where a version differs from the one that was noted down with the last archive, there\n"
+                  "is something to archive again.");
+    verb.require_subcommand(1);
+    for (const VerbDefinition& definition : ARCHIVE_VERSION_VERBS) {
+        addVerb(verb, definition, options);
+    }
+}
+
+const std::array<VerbDefinition, 9> VERBS = {{
+    {"add", "put a job into the queue, and print its id", defineAdd},
+    {"list", "list the jobs that wait or run", defineList},
+    {"show", "show one job with its parameters", defineShow},
+    {"remove", "remove jobs, running ones too", defineRemove},
+    {"wait", "wait until jobs have ended", defineWait},
+    {"backends", "list the installed backends and what they can do", defineBackends},
+    {"status", "tell what may start now, and what is at work", defineStatus},
+    {"session", "make, find and remove session directories", defineSession},
+    {"archive-version", "read or increase archive versions of files and file systems", defineArchiveVersion},
+}};
 
 bool lacksVerb(const CLI::App& app) {
     const std::vector<CLI::App*> chosen = app.get_subcommands();
     return chosen.empty() ? app.get_require_subcommand_min() > 0 : lacksVerb(*chosen.front());
 }
 
+void define(CLI::App& app, Options& options, const std::function<bool(const VerbDefinition&)>& isWanted) {
+    app.description("Asks the backup queue daemon, marubackupd, to do jobs, and about them.\n"
+                    "Data goes to standard output, everything else to standard error.");
+    defineGlobals(app, options.globals);
+    for (const VerbDefinition& definition : VERBS) {
+        if (isWanted(definition)) {
+            addVerb(app, definition, options);
+        }
+    }
+}
+
+/** Tells the user what is asked for, or wrong. The result is the exit status. */
+int tell(const CLI::App& app, const CLI::ParseError& end) {
+    std::ostringstream out;
+    std::ostringstream err;
+    if (app.exit(end, out, err) == 0) {
+        putData(out.str());
+        return EXIT_DONE;
+    }
+    const bool noVerb = end.get_exit_code() == static_cast<int>(CLI::ExitCodes::RequiredError) && lacksVerb(app);
+    say((noVerb ? "a verb is missing, or is none of those that there are" : end.what()) + HINT);
+    return EXIT_USAGE;
+}
+
 } // namespace
 
 std::optional<int> readOptions(int argc, char** argv, Options& options) {
-    CLI::App app("Asks the backup queue daemon, marubackupd, to do jobs, and about them.\n"
-                 "Data goes to standard output, everything else to standard error.");
-    defineGlobals(app, options.globals);
-    defineAdd(app, options);
-    defineList(app, options);
-    defineShow(app, options);
-    defineRemove(app, options);
-    defineWait(app, options);
-    defineBackends(app, options);
-    defineStatus(app, options);
-    defineSession(app, options);
-    defineArchiveVersion(app, options);
+    // Scripts start this tool once for each job, and all verbs with their options take longer to
+    // define than a job to add. One that is no word of the line is not asked for.
+    CLI::App named;
+    define(named, options, [argc, argv](const VerbDefinition& verb) {
+        return std::find(argv, argv + argc, std::string_view(verb.name)) != argv + argc;
+    });
     try {
-        app.parse(argc, argv);
+        named.parse(argc, argv);
+        return std::nullopt;
+    } catch (const CLI::ParseError&) {
+    }
+
+    // Help, and what is said of a mistake, may be about any.
+    CLI::App all;
+    define(all, options, [](const VerbDefinition&) { return true; });
+    try {
+        all.parse(argc, argv);
         return std::nullopt;
     } catch (const CLI::ParseError& end) {
-        std::ostringstream out;
-        std::ostringstream err;
-        if (app.exit(end, out, err) == 0) {
-            putData(out.str());
-            return EXIT_DONE;
-        }
-        const bool noVerb = end.get_exit_code() == static_cast<int>(CLI::ExitCodes::RequiredError) && lacksVerb(app);
-        say((noVerb ? "a verb is missing, or is none of those that there are" : end.what()) + HINT);
-        return EXIT_USAGE;
+        return tell(all, end);
     }
 }
