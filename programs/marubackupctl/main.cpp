@@ -31,7 +31,7 @@ int main(int argc, char** argv) {
     openlog("marubackupctl", LOG_PID, LOG_USER);
     // A daemon or a reader of ours that goes away is an answer, not our end.
     std::signal(SIGPIPE, SIG_IGN);
-    startWatching({std::string(), sayLine("interrupted"), EXIT_INTERRUPTED});
+    setInterrupted({std::string(), sayLine("interrupted"), EXIT_INTERRUPTED});
     try {
         return runTool(argc, argv);
     } catch (const std::exception& problem) {

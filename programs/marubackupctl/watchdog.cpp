@@ -27,23 +27,34 @@ const int WAKE_UP = SIGALRM;
     _exit(words.status);
 }
 
+bool isIgnored(int signal) {
+    struct sigaction inherited = {};
+    sigaction(signal, nullptr, &inherited);
+    return inherited.sa_handler == SIG_IGN;
+}
+
 /** The thread that watches, and what it is told. Never destroyed, since the thread lasts as long as the process. */
 class Watcher {
 public:
-    Watcher(const LastWords& onInterrupt, const sigset_t& awaited) : interrupted(onInterrupt), signals(awaited) {
-        thread = std::thread(&Watcher::watch, this);
+    explicit Watcher(const LastWords& onInterrupt) : interrupted(onInterrupt) {
     }
 
     void guard(double seconds, const LastWords& onLate, const std::optional<LastWords>& onGone) {
-        const std::lock_guard<std::mutex> lock(mutex);
-        late = onLate;
-        gone = onGone;
-        const Clock::time_point now = Clock::now();
-        deadline = now + std::chrono::duration_cast<Clock::duration>(std::chrono::duration<double>(seconds));
-        // One that is not there to begin with is the call's own answer.
-        nextLook = now + LOOK_EVERY;
-        guarding = true;
-        pthread_kill(thread.native_handle(), WAKE_UP);
+        {
+            const std::lock_guard<std::mutex> lock(mutex);
+            late = onLate;
+            gone = onGone;
+            const Clock::time_point now = Clock::now();
+            deadline = now + std::chrono::duration_cast<Clock::duration>(std::chrono::duration<double>(seconds));
+            // One that is not there to begin with is the call's own answer.
+            nextLook = now + LOOK_EVERY;
+            guarding = true;
+        }
+        if (thread.joinable()) {
+            pthread_kill(thread.native_handle(), WAKE_UP);
+        } else {
+            start();
+        }
     }
 
     void leave() {
@@ -52,6 +63,17 @@ public:
     }
 
 private:
+    void start() {
+        sigemptyset(&signals);
+        sigaddset(&signals, WAKE_UP);
+        if (!isIgnored(SIGINT)) {
+            sigaddset(&signals, SIGINT);
+        }
+        // No thread takes them but the one that waits for them.
+        pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+        thread = std::thread(&Watcher::watch, this);
+    }
+
     [[noreturn]] void watch() {
         while (true) {
             const Clock::duration pause = look();
@@ -84,7 +106,7 @@ private:
     }
 
     const LastWords interrupted;
-    const sigset_t signals;
+    sigset_t signals = {};
     std::mutex mutex;
     bool guarding = false;
     LastWords late;
@@ -96,24 +118,10 @@ private:
 
 Watcher* watcher = nullptr;
 
-bool isIgnored(int signal) {
-    struct sigaction inherited = {};
-    sigaction(signal, nullptr, &inherited);
-    return inherited.sa_handler == SIG_IGN;
-}
-
 } // namespace
 
-void startWatching(const LastWords& interrupted) {
-    sigset_t awaited;
-    sigemptyset(&awaited);
-    sigaddset(&awaited, WAKE_UP);
-    if (!isIgnored(SIGINT)) {
-        sigaddset(&awaited, SIGINT);
-    }
-    // No thread takes them but the one that waits for them.
-    pthread_sigmask(SIG_BLOCK, &awaited, nullptr);
-    watcher = new Watcher(interrupted, awaited);
+void setInterrupted(const LastWords& interrupted) {
+    watcher = new Watcher(interrupted);
 }
 
 Watchdog::Watchdog(double seconds, const LastWords& late, const std::optional<LastWords>& gone) {

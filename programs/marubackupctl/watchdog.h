@@ -11,18 +11,18 @@ struct LastWords {
 };
 
 /**
- * Starts the thread that watches over this one, which it ends with `interrupted`
- * on SIGINT, unless whoever started the program ignores that signal. Once, before
- * any other thread there is.
+ * Has the process end with `interrupted` on SIGINT, from the first Watchdog on, unless
+ * whoever started the program ignores that signal. Before that, SIGINT ends it as it
+ * ends any program. Once.
  */
-void startWatching(const LastWords& interrupted);
+void setInterrupted(const LastWords& interrupted);
 
 /**
  * Guards a call into the library, which has no time-out: as long as the object
  * lives, the process is ended when `seconds` have passed, with `late`, or when
  * the daemon has gone, with `gone` if that is given. (A call whose daemon went
- * away in the middle of it would not return.) One at a time, and after
- * startWatching().
+ * away in the middle of it would not return.) One at a time, after setInterrupted();
+ * the first starts the thread that watches.
  */
 class Watchdog {
 public:
