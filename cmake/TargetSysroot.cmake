@@ -5,11 +5,8 @@ set(CMAKE_CXX_COMPILER ${target}-g++)
 set(CMAKE_LIBRARY_ARCHITECTURE ${target})
 
 if(NOT MARUBACKUP_SYSROOT)
-    if(NOT "$ENV{XDG_CACHE_HOME}" STREQUAL "")
-        set(MARUBACKUP_SYSROOT $ENV{XDG_CACHE_HOME}/marubackup/${target}/sysroot)
-    else()
-        set(MARUBACKUP_SYSROOT $ENV{HOME}/.cache/marubackup/${target}/sysroot)
-    endif()
+    include(${CMAKE_CURRENT_LIST_DIR}/Sysroot.cmake)
+    marubackup_sysroot(MARUBACKUP_SYSROOT ${target})
 endif()
 list(APPEND CMAKE_TRY_COMPILE_PLATFORM_VARIABLES MARUBACKUP_SYSROOT)
 
