@@ -15,7 +15,8 @@ bool isEmulated() {
     const ssize_t length = readlinkat(self, "exe", target, sizeof target);
     close(self);
     const std::string running(target, length > 0 ? static_cast<std::size_t>(length) : 0);
-    return running.find("/qemu-") != std::string::npos;
+    const std::string name = running.substr(running.rfind('/') + 1);
+    return name.rfind("qemu-", 0) == 0;
 }
 
 } // namespace support
