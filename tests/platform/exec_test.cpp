@@ -10,6 +10,7 @@
 
 #include <cerrno>
 #include <cstdlib>
+#include <filesystem>
 #include <string>
 #include <thread>
 #include <vector>
@@ -52,6 +53,15 @@ class AnExecutedProgram : public testing::Test {
 protected:
     AnExecutedProgram() {
         MLIBCErrSetEx(MLIBC_ERR_NONE, nullptr, 0);
+    }
+
+    /** Calls by its name alone, from another folder, a program that PATH leads to, and that leaves the file `out`. */
+    int callNamedInPath() const {
+        std::filesystem::create_directory(dir.path("bin"));
+        support::writeFile(dir.path("bin/program"), "#!/bin/sh\necho > " + out + "\n", 0755);
+        setenv("PATH", dir.path("bin").c_str(), 1);
+        std::filesystem::current_path(dir.path());
+        return MLIBCExec("program", nullptr);
     }
 
     const support::TempDir dir;
@@ -97,12 +107,16 @@ TEST_F(AnExecutedProgram, MustBeOneThatCanBeRun) {
 }
 
 TEST_F(AnExecutedProgram, IsNotLookedForInPath) {
+    const int status = runInChild([this] { return callNamedInPath() != 0 ? 0 : 1; });
+
+    EXPECT_EQ("exit 0", describeStatus(status));
+    EXPECT_FALSE(std::filesystem::exists(out));
+}
+
+TEST_F(AnExecutedProgram, CannotBeRunIfOnlyPathLeadsToIt) {
     SKIP_IF_EMULATED(support::SPAWN_ERRORS);
-    const int status = runInChild([this] {
-        const bool moved = chdir(dir.path().c_str()) == 0;
-        setenv("PATH", "/usr/bin:/bin", 1);
-        return moved && MLIBCExec("true", nullptr) < 0 && MLIBCErrGet() == MLIBC_ERR_EXEC ? 0 : 1;
-    });
+    const int status = runInChild([this] { return callNamedInPath() < 0 && MLIBCErrGet() == MLIBC_ERR_EXEC ? 0 : 1; });
+
     EXPECT_EQ("exit 0", describeStatus(status));
 }
 
@@ -197,19 +211,31 @@ TEST_F(AnExecutedProgram, IsNoLongerAChildAfterwards) {
     EXPECT_EQ("exit 0", describeStatus(status));
 }
 
-TEST_F(AnExecutedProgram, AnswersTheThreadThatAsked) {
-    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
+namespace {
+
+/** Has several threads ask at once; every other one of them is refused at last, by `refused` and with `code`. */
+void askInThreads(int code, int (*refused)()) {
     std::vector<std::thread> threads;
     for (int number = 0; number < 8; ++number) {
-        threads.emplace_back([number] {
+        threads.emplace_back([=] {
             for (int round = 0; round < 5; ++round) {
                 EXPECT_EQ(number, runShell("exit " + std::to_string(number)));
             }
-            expectFailure(number % 2 ? MLIBC_ERR_KILLED : MLIBC_ERR_EXEC,
-                          number % 2 ? runShell("kill -KILL $$") : MLIBCExec("/nowhere", nullptr));
+            expectFailure(number % 2 ? MLIBC_ERR_KILLED : code, number % 2 ? runShell("kill -KILL $$") : refused());
         });
     }
     for (std::thread& thread : threads) {
         thread.join();
     }
+}
+
+} // namespace
+
+TEST_F(AnExecutedProgram, AnswersTheThreadThatAsked) {
+    askInThreads(MLIBC_ERR_BAD_PARAMETER, [] { return MLIBCExec("", nullptr); });
+}
+
+TEST_F(AnExecutedProgram, ThatCannotBeRunFailsForTheThreadThatAsked) {
+    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
+    askInThreads(MLIBC_ERR_EXEC, [] { return MLIBCExec("/nowhere", nullptr); });
 }

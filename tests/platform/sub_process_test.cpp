@@ -15,6 +15,7 @@
 #include <functional>
 #include <vector>
 
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include "support/emulation.h"
@@ -34,6 +35,8 @@ using support::readFile;
 using support::runInChild;
 using support::TempDir;
 using support::writeFile;
+using testing::Each;
+using testing::Ne;
 
 namespace {
 
@@ -92,6 +95,33 @@ protected:
         return program;
     }
 
+    /** What `process`, which does not run, makes its caller report. */
+    std::string reportOf(SubProcess& process) {
+        const std::string report = dir.path("report");
+        writeFile(report, "");
+        // Its own errors go to another file; why it is not there to write any does not.
+        process.setStdError(err, 0);
+        outcome(process, [&] { dup2(open(report.c_str(), O_WRONLY), STDERR_FILENO); });
+        return readFile(report);
+    }
+
+    /** Runs a file that only a shell could make sense of, and that leaves the file `ran`, by its path and by its name. */
+    std::vector<std::string> outcomesOfAScriptWithoutInterpreter() {
+        const std::string script = dir.path("script");
+        writeFile(script, "echo > " + ran + "\n", 0755);
+        const auto searchThere = [this] { setenv("PATH", dir.path().c_str(), 1); };
+        return {outcome(SubProcess({script})), outcome(SubProcess({"script"}), searchThere)};
+    }
+
+    /** Runs a program that leaves the file `ran`, first its output and then its errors going to `path`. */
+    std::vector<std::string> outcomesWithOutputTo(const std::string& path) {
+        SubProcess output({"touch", ran});
+        output.setStdOutput(path, 0);
+        SubProcess error({"touch", ran});
+        error.setStdError(path, 0);
+        return {outcome(output), outcome(error)};
+    }
+
     /** What outcome() says of a program that the kernel does not take. */
     static std::string refusal(const std::string& reason) {
         return GetParam() == Way::START ? "exit 127" : "failed: " + reason;
@@ -100,6 +130,7 @@ protected:
     const TempDir dir;
     const std::string out = dir.path("out");
     const std::string err = dir.path("err");
+    const std::string ran = dir.path("ran");
 
 private:
     static int run(const SubProcess& process) {
@@ -188,8 +219,11 @@ TEST_P(ARunProgram, MustBeThere) {
         SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     }
     EXPECT_EQ(refusal("No such file or directory"), outcome(SubProcess({dir.path("missing")})));
-    EXPECT_EQ("failed: No such file or directory", outcome(SubProcess({"marubackup-test-no-such-program"})));
     EXPECT_EQ(refusal("Not a directory"), outcome(SubProcess({"/dev/null/program"})));
+}
+
+TEST_P(ARunProgram, MustBeInPathIfOnlyItsNameIsGiven) {
+    EXPECT_EQ("failed: No such file or directory", outcome(SubProcess({"marubackup-test-no-such-program"})));
 }
 
 TEST_P(ARunProgram, MustBeAnExecutableFile) {
@@ -210,14 +244,15 @@ TEST_P(ARunProgram, MayBeAScriptThatNamesItsInterpreter) {
 }
 
 TEST_P(ARunProgram, IsNotHandedToAShellIfItIsNoProgram) {
+    EXPECT_THAT(outcomesOfAScriptWithoutInterpreter(), Each(Ne("exit 0")));
+    EXPECT_FALSE(exists(ran));
+}
+
+TEST_P(ARunProgram, IsRefusedIfItIsNoProgram) {
     if (GetParam() == Way::CALL) {
         SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     }
-    writeFile(dir.path("script"), "exit 0\n", 0755);
-    const auto searchThere = [this] { setenv("PATH", dir.path().c_str(), 1); };
-
-    EXPECT_EQ(refusal("Exec format error"), outcome(SubProcess({dir.path("script")})));
-    EXPECT_EQ(refusal("Exec format error"), outcome(SubProcess({"script"}), searchThere));
+    EXPECT_EQ(std::vector<std::string>(2, refusal("Exec format error")), outcomesOfAScriptWithoutInterpreter());
 }
 
 TEST_P(ARunProgram, IsRefusedIfItsArgumentsAreTooLong) {
@@ -255,30 +290,17 @@ TEST_P(ARunProgram, IsRefusedIfATextCannotReachTheKernelWhole) {
     EXPECT_FALSE(exists(out)) << "a refused program's output file was made";
 }
 
-TEST_P(ARunProgram, IsReportedOnOneLineIfItDoesNotRun) {
-    if (GetParam() == Way::CALL) {
-        SKIP_IF_EMULATED(support::SPAWN_ERRORS);
-    }
-    const auto reportOf = [this](SubProcess& process) {
-        const std::string report = dir.path("report");
-        writeFile(report, "");
-        outcome(process, [&] { dup2(open(report.c_str(), O_WRONLY), STDERR_FILENO); });
-        return readFile(report);
-    };
+TEST_P(ARunProgram, IsReportedOnOneLineIfItIsNotFoundOrNoneIsNamed) {
     const std::string longName(300, 'x');
     const std::vector<std::pair<std::list<std::string>, std::string>> rows = {
         {{}, "cannot run []: no program is named\n"},
         {{"missing"}, "cannot run [missing]: No such file or directory\n"},
-        {{"/etc/passwd"}, "cannot run [/etc/passwd]: Permission denied\n"},
         {{"true", std::string("\0", 1)}, "cannot run [true]: an argument contains a NUL byte\n"},
-        {{"true", std::string(1 << 20, 'x')}, "cannot run [true]: Argument list too long\n"},
         {{"no\nsuch\x1b[1m\x7f"}, "cannot run [no?such?[1m?]: No such file or directory\n"},
         {{longName}, "cannot run [" + longName.substr(0, 200) + "...]: No such file or directory\n"},
     };
     for (const auto& [argv, expected] : rows) {
         SubProcess process(argv);
-        // Its own errors go to another file; why it is not there to write any does not.
-        process.setStdError(err, 0);
         EXPECT_EQ(expected, reportOf(process));
     }
     SubProcess named({"true"});
@@ -288,6 +310,17 @@ TEST_P(ARunProgram, IsReportedOnOneLineIfItDoesNotRun) {
     SubProcess split({"true"});
     split.setStdOutput(std::string("\0", 1), 0);
     EXPECT_EQ("cannot run [true]: an output file's name contains a NUL byte\n", reportOf(split));
+}
+
+TEST_P(ARunProgram, IsReportedOnOneLineIfTheKernelRefusesIt) {
+    if (GetParam() == Way::CALL) {
+        SKIP_IF_EMULATED(support::SPAWN_ERRORS);
+    }
+    SubProcess plainFile({"/etc/passwd"});
+    SubProcess tooLong({"true", std::string(1 << 20, 'x')});
+
+    EXPECT_EQ("cannot run [/etc/passwd]: Permission denied\n", reportOf(plainFile));
+    EXPECT_EQ("cannot run [true]: Argument list too long\n", reportOf(tooLong));
 }
 
 TEST_P(ARunProgram, IsNotReportedIfItRuns) {
@@ -439,25 +472,21 @@ TEST_P(ARunProgram, WritesBothStreamsToOneFileInOrder) {
 }
 
 TEST_P(ARunProgram, IsNotStartedIfAnOutputFileCannotBeOpened) {
+    for (const std::string& path : {dir.path("missing/file"), dir.path(), std::string()}) {
+        EXPECT_THAT(outcomesWithOutputTo(path), Each(Ne("exit 0"))) << path;
+    }
+    EXPECT_FALSE(exists(ran));
+}
+
+TEST_P(ARunProgram, FailsForTheReasonThatAnOutputFileCannotBeOpened) {
     if (GetParam() == Way::CALL) {
         SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     }
-    const std::string ran = dir.path("ran");
-    const std::vector<std::pair<std::string, std::string>> outcomes = {
-        {dir.path("missing/file"), "failed: No such file or directory"},
-        {dir.path(), "failed: Is a directory"},
-        {"", "failed: No such file or directory"},
-    };
-    for (const auto& [path, expected] : outcomes) {
-        SubProcess output({"touch", ran});
-        output.setStdOutput(path, 0);
-        EXPECT_EQ(expected, outcome(output)) << "output: " << path;
+    const auto failed = [](const std::string& reason) { return std::vector<std::string>(2, "failed: " + reason); };
 
-        SubProcess error({"touch", ran});
-        error.setStdError(path, 0);
-        EXPECT_EQ(expected, outcome(error)) << "error output: " << path;
-    }
-    EXPECT_FALSE(exists(ran));
+    EXPECT_EQ(failed("No such file or directory"), outcomesWithOutputTo(dir.path("missing/file")));
+    EXPECT_EQ(failed("Is a directory"), outcomesWithOutputTo(dir.path()));
+    EXPECT_EQ(failed("No such file or directory"), outcomesWithOutputTo(""));
 }
 
 // What it starts with.
@@ -626,23 +655,37 @@ TEST(ACaller, KeepsItsSignalsItsDescriptorsAndItsEnvironment) {
     EXPECT_EQ("", readFile(dir.path("out")));
 }
 
-TEST(ACaller, LeavesNoChildAndNoDescriptorBehind) {
-    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
-    const TempDir dir;
-    const int status = runInChild([&] {
+namespace {
+
+/** Calls `program` from a child made for it, which ends with 0 if the call's result is that and nothing is left of it. */
+int callAndLookForRemains(const SubProcess& program, int result) {
+    return runInChild([&] {
         const int before = dup(STDOUT_FILENO);
         close(before);
-        SubProcess process({"true"});
-        process.setStdOutput(dir.path("out"), 0);
-        SubProcess failing({"true"});
-        failing.setStdOutput(dir.path("missing/out"), 0);
-        if (process.call() != 0 || failing.call() != -1) {
+        if (program.call() != result) {
             return 1;
         }
         return dup(STDOUT_FILENO) == before && waitpid(-1, nullptr, WNOHANG) == -1 && errno == ECHILD ? 0 : 2;
     });
+}
 
-    EXPECT_EQ("exit 0", describeStatus(status));
+} // namespace
+
+TEST(ACaller, LeavesNoChildAndNoDescriptorBehind) {
+    const TempDir dir;
+    SubProcess process({"true"});
+    process.setStdOutput(dir.path("out"), 0);
+
+    EXPECT_EQ("exit 0", describeStatus(callAndLookForRemains(process, 0)));
+}
+
+TEST(ACaller, LeavesNoChildAndNoDescriptorBehindOfWhatCannotBeRun) {
+    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
+    const TempDir dir;
+    SubProcess failing({"true"});
+    failing.setStdOutput(dir.path("missing/out"), 0);
+
+    EXPECT_EQ("exit 0", describeStatus(callAndLookForRemains(failing, -1)));
 }
 
 // What start() alone promises.
