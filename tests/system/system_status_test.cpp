@@ -89,6 +89,17 @@ protected:
         EXPECT_EQ(copyTo, System::isCopyToRunning(""));
     }
 
+    /** That the snapshot tool's answer is lost, which lets a backup start, and that the log tells so, with `code`. */
+    void expectComplaint(const std::string& code) {
+        EXPECT_EQ(UNTOUCHED, reasonOf(System::canBackup));
+
+        const support::SyslogLine line = log.waitFor("Failed to exec");
+        EXPECT_EQ(LOG_ERR, line.priority);
+        EXPECT_EQ(0U, line.message.rfind("system_status:", 0)) << line.message;
+        const std::string complaint = " Failed to exec marusharesnaptool binary with is-restore-running [" + code + " ";
+        EXPECT_NE(std::string::npos, line.message.find(complaint)) << line.message;
+    }
+
     /** Waits for the job's end, and until the daemon has forgotten it. */
     void awaitEnd(const Job& job) {
         EXPECT_TRUE(support::waitUntil([&] { return statusOf(job) == Job::STATUS_NONE; }));
@@ -232,18 +243,17 @@ TEST_F(SystemStatus, ASnapshotRestoreHoldsBackEverythingAndIsNamedBeforeABackup)
     EXPECT_FALSE(System::canCopyTo());
 }
 
+TEST_F(SystemStatus, AToolThatIsKilledIsToldToTheLogWithoutTheProcess) {
+    support::installSnapshotTool("kill -KILL $$");
+
+    expectComplaint("0x0A01");
+}
+
 TEST_F(SystemStatus, AToolThatCannotBeRunIsToldToTheLogWithoutTheProcess) {
     SKIP_IF_EMULATED(support::SPAWN_ERRORS);
     std::filesystem::remove(support::SNAPSHOT_TOOL);
 
-    EXPECT_EQ(UNTOUCHED, reasonOf(System::canBackup));
-
-    const support::SyslogLine line = log.waitFor("Failed to exec");
-    EXPECT_EQ(LOG_ERR, line.priority);
-    EXPECT_EQ(0U, line.message.rfind("system_status:", 0)) << line.message;
-    EXPECT_NE(std::string::npos,
-              line.message.find(" Failed to exec marusharesnaptool binary with is-restore-running [0x0A00 "))
-        << line.message;
+    expectComplaint("0x0A00");
 }
 
 TEST_F(SystemStatus, ADaemonThatHasEndedHoldsNothingBack) {

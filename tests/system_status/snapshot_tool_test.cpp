@@ -3,6 +3,7 @@
 
 #include <csignal>
 #include <filesystem>
+#include <functional>
 #include <regex>
 #include <string>
 
@@ -39,6 +40,18 @@ private:
 const char* const CANNOT_BE_RUN = "0x0A00";
 const char* const KILLED = "0x0A01";
 
+/** Each follows the one before it. */
+const std::function<void()> WAYS_TO_BE_USELESS[] = {
+    [] { EXPECT_EQ(0, chmod(support::SNAPSHOT_TOOL, 0644)); },
+    [] { support::writeFile(support::SNAPSHOT_TOOL, "exit 1\n", 0755); },
+    [] {
+        std::filesystem::remove(support::SNAPSHOT_TOOL);
+        std::filesystem::create_directory(support::SNAPSHOT_TOOL);
+    },
+    [] { std::filesystem::remove(support::SNAPSHOT_TOOL); },
+    [] { std::filesystem::remove_all(std::filesystem::path(support::SNAPSHOT_TOOL).parent_path()); },
+};
+
 } // namespace
 
 TEST_F(SnapshotTool, HoldsABackupBackByOneAlone) {
@@ -54,26 +67,19 @@ TEST_F(SnapshotTool, HoldsABackupBackByOneAlone) {
     EXPECT_EQ(0, log.count("Failed to exec"));
 }
 
-TEST_F(SnapshotTool, MayBeMissing) {
-    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
-    std::filesystem::remove(support::SNAPSHOT_TOOL);
-    expectComplaint(CANNOT_BE_RUN);
-
-    std::filesystem::remove_all(std::filesystem::path(support::SNAPSHOT_TOOL).parent_path());
-    expectComplaint(CANNOT_BE_RUN);
+TEST_F(SnapshotTool, HoldsNothingBackIfItCannotBeRun) {
+    for (const auto& makeUseless : WAYS_TO_BE_USELESS) {
+        makeUseless();
+        EXPECT_EQ(ALLOWED, ask(System::canBackup));
+    }
 }
 
-TEST_F(SnapshotTool, MayBeNoProgram) {
+TEST_F(SnapshotTool, IsComplainedOfIfItCannotBeRun) {
     SKIP_IF_EMULATED(support::SPAWN_ERRORS);
-    ASSERT_EQ(0, chmod(support::SNAPSHOT_TOOL, 0644));
-    expectComplaint(CANNOT_BE_RUN);
-
-    support::writeFile(support::SNAPSHOT_TOOL, "exit 1\n", 0755);
-    expectComplaint(CANNOT_BE_RUN);
-
-    std::filesystem::remove(support::SNAPSHOT_TOOL);
-    std::filesystem::create_directory(support::SNAPSHOT_TOOL);
-    expectComplaint(CANNOT_BE_RUN);
+    for (const auto& makeUseless : WAYS_TO_BE_USELESS) {
+        makeUseless();
+        expectComplaint(CANNOT_BE_RUN);
+    }
 }
 
 TEST_F(SnapshotTool, MayBeEndedByASignal) {
@@ -85,8 +91,7 @@ TEST_F(SnapshotTool, MayBeEndedByASignal) {
 }
 
 TEST_F(SnapshotTool, IsComplainedOfOnceAPredicate) {
-    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
-    std::filesystem::remove(support::SNAPSHOT_TOOL);
+    support::installSnapshotTool("kill -KILL $$");
 
     EXPECT_EQ(ALLOWED, ask(System::canRestore));
     EXPECT_EQ(1, log.count("Failed to exec"));

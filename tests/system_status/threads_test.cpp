@@ -6,7 +6,6 @@
 
 #include "status_fixture.h"
 #include "support/appliance.h"
-#include "support/emulation.h"
 #include "support/fake_daemon.h"
 
 using namespace MARU::Backup;
@@ -61,12 +60,11 @@ TEST_F(SeveralThreads, AskTheDaemonSideBySide) {
 }
 
 TEST_F(SeveralThreads, ComplainEachOfTheirOwnFailure) {
-    SKIP_IF_EMULATED(support::SPAWN_ERRORS);
-    std::filesystem::remove(support::SNAPSHOT_TOOL);
+    support::installSnapshotTool("kill -KILL $$");
 
     inThreads([] { EXPECT_TRUE(System::canBackup()); });
 
-    EXPECT_EQ(THREADS * ROUNDS, log.count("is-restore-running [0x0A00 exec.cpp:"));
+    EXPECT_EQ(THREADS * ROUNDS, log.count("is-restore-running [0x0A01 exec.cpp:"));
 }
 
 TEST_F(SeveralThreads, SeeATaskThatComesAndGoes) {
