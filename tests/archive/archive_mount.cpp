@@ -48,16 +48,10 @@ std::string whyNotAllowed(const std::string& folder) {
 
 } // namespace
 
-void passRequestsOn() {
-    if (support::isEmulated()) {
-        setenv("LD_PRELOAD", ARCHIVE_VERSION_SERVED_BY, 1);
-    }
-}
-
 std::unique_ptr<ArchiveMount> ArchiveMount::make(std::string& reason) {
     std::unique_ptr<ArchiveMount> mount(new ArchiveMount);
     if (support::isEmulated()) {
-        passRequestsOn();
+        setenv("LD_PRELOAD", ARCHIVE_VERSION_SERVED_BY, 1);
         mount->makeFolder();
         return mount;
     }

@@ -9,15 +9,10 @@
 #include "support/temp_dir.h"
 
 /**
- * Where an emulator answers requests to file systems itself, has them answered by
- * requests_stand_in.cpp in the programs that are started from now on. Nothing elsewhere.
- */
-void passRequestsOn();
-
-/**
  * A file system with an archive version, mounted in the sandbox for as long as the
  * object lives. archive_version_fs.cpp tells what is in it. Under an emulator it is a
- * folder with the same things in it, for requests_stand_in.cpp.
+ * folder with the same things in it, for requests_stand_in.cpp, which answers in the
+ * test itself and in the programs that share their libraries.
  */
 class ArchiveMount {
 public:
