@@ -15,7 +15,7 @@ TOOLS = ROOT / "build" / "bench" / "bench"
 README = ROOT / "README.md"
 PERFORMANCE = ROOT / "docs" / "performance.md"
 PLOT = ROOT / "docs" / "performance.svg"
-ROUNDS = 11
+ROUNDS = 33
 QUICK_ROUNDS = 3
 
 

@@ -15,7 +15,7 @@ SLOTS = 5
 AT_REST = 10  # seconds
 QUICK_AT_REST = 4
 LAUNCHES = 15  # in one round
-DEAR_ROUNDS = 3  # of what takes seconds
+DEAR_ROUNDS = 5  # of what takes seconds
 
 
 @dataclasses.dataclass(frozen=True)
